@@ -1,0 +1,147 @@
+#include "log_manager.h"
+
+#include <sys/time.h>
+
+#include <new>
+
+#include "collectors/app_usage_monitor.h"
+#include "collectors/crash_monitor.h"
+#include "collectors/device_status_monitor.h"
+#include "collectors/package_monitor.h"
+#include "provider_registry.h"
+#include "reporting/report_scheduler.h"
+#include "storage/db_manager.h"
+#include "storage/pref_store.h"
+
+namespace _CorvaneLogManager {
+
+namespace {
+LogManager* g_instance = nullptr;
+}  // namespace
+
+LogManager* LogManager::GetInstance() {
+  if (g_instance != nullptr) return g_instance;
+  LogManager* manager = new (std::nothrow) LogManager();
+  if (manager == nullptr) return nullptr;
+  // Stored before construction finishes: a failed construction still leaves the half-built
+  // instance for the next call. Deliberate; the first caller treats null as fatal.
+  g_instance = manager;
+  if (manager->Construct() != 0) return nullptr;
+  return manager;
+}
+
+void LogManager::DestroyInstance() {
+  delete g_instance;
+  g_instance = nullptr;
+}
+
+int LogManager::Construct() {
+  prefStore = new (std::nothrow) PrefStore();
+  if (prefStore == nullptr) return -1;
+  if (prefStore->Create() == -1) {
+    delete prefStore;
+    prefStore = nullptr;
+    return -1;
+  }
+
+  appUsageMonitor = new (std::nothrow) AppUsageMonitor();
+  packageMonitor = new (std::nothrow) PackageMonitor();
+  crashMonitor = new (std::nothrow) CrashMonitor();
+  deviceStatusMonitor = new (std::nothrow) DeviceStatusMonitor();
+  scheduler = new (std::nothrow) ReportScheduler();
+  if (appUsageMonitor == nullptr || packageMonitor == nullptr || deviceStatusMonitor == nullptr ||
+      crashMonitor == nullptr || scheduler == nullptr) {
+    ReleaseMonitors();  // the preference store stays
+    return -1;
+  }
+  return scheduler->Create() != 0 ? -1 : 0;
+}
+
+void LogManager::ReleaseMonitors() {
+  delete appUsageMonitor;
+  delete packageMonitor;
+  delete crashMonitor;
+  delete deviceStatusMonitor;
+  delete scheduler;
+  appUsageMonitor = nullptr;
+  packageMonitor = nullptr;
+  crashMonitor = nullptr;
+  deviceStatusMonitor = nullptr;
+  scheduler = nullptr;
+}
+
+int LogManager::Init() {
+  // Nothing is undone on failure: the start idler retries, and every step tolerates a rerun.
+  registry = ProviderRegistry::GetInstance();
+  if (registry == nullptr) return -1;
+  dbManager = DbManager::GetInstance();
+  if (dbManager == nullptr) return -1;
+  uploadDbManager = UploadDbManager::GetInstance();
+  if (uploadDbManager == nullptr) return -1;
+  if (registry->CreateProviders() != 0) return -1;
+  if (dbManager->Init() != 0) return -1;
+  if (uploadDbManager->Init() != 0) return -1;
+  SetRuntimeSwitch(0, true);
+  SetRuntimeSwitch(1, true);
+  SetName();
+  if (Start() != 0) return -1;
+  (void)scheduler->Init();
+  initialised = true;
+  return 0;
+}
+
+int LogManager::Start() {
+  if (appUsageMonitor != nullptr && appUsageMonitor->Start() != 0) return -1;
+  if (packageMonitor != nullptr && packageMonitor->Start() != 0) return -1;
+  if (crashMonitor != nullptr && crashMonitor->Start() != 0) return -1;
+  if (deviceStatusMonitor == nullptr) return 0;
+  if (deviceStatusMonitor->Recover() != 0 || deviceStatusMonitor->Start() != 0) return -1;
+  deviceStatusMonitor->SetAppUsageMonitor(appUsageMonitor);
+  return 0;
+}
+
+void LogManager::Stop() {
+  initialised = false;
+  if (scheduler != nullptr) {
+    scheduler->Stop();
+    delete scheduler;
+    scheduler = nullptr;
+  }
+
+  // Written before any database closes, so a restart can close the periods left open.
+  struct timeval tv;
+  gettimeofday(&tv, nullptr);
+  long long nowMs = static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
+  if (prefStore != nullptr) (void)prefStore->SetLastShutdownTime(static_cast<int32_t>(nowMs / 1000));
+
+  if (dbManager != nullptr) DbManager::CloseInstance();
+  if (uploadDbManager != nullptr) UploadDbManager::CloseInstance();
+  if (prefStore != nullptr) {
+    (void)prefStore->Close();
+    delete prefStore;
+  }
+  if (registry != nullptr) ProviderRegistry::Release();
+
+  if (packageMonitor != nullptr) (void)packageMonitor->Stop();
+  if (crashMonitor != nullptr) (void)crashMonitor->Stop();
+  if (deviceStatusMonitor != nullptr) (void)deviceStatusMonitor->Stop();
+  delete appUsageMonitor;
+  delete packageMonitor;
+  delete crashMonitor;
+  delete deviceStatusMonitor;
+
+  prefStore = nullptr;
+  appUsageMonitor = nullptr;
+  packageMonitor = nullptr;
+  crashMonitor = nullptr;
+  deviceStatusMonitor = nullptr;
+  registry = nullptr;
+  dbManager = nullptr;
+  uploadDbManager = nullptr;
+}
+
+void LogManager::SetName() { name = "com.corvane.logmanager"; }
+
+std::string LogManager::GetDeviceId() const { return CachedDeviceId(); }
+
+}  // namespace _CorvaneLogManager

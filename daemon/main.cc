@@ -1,0 +1,3 @@
+#include "daemon_lifecycle.h"
+
+int main() { return _CorvaneLogManager::RunDaemon(); }

@@ -1,0 +1,62 @@
+// LogManager: the process-wide owner of every long-lived component and of their order of
+// creation, start and stop.
+#ifndef LOGMGR_INCLUDE_LOG_MANAGER_H_
+#define LOGMGR_INCLUDE_LOG_MANAGER_H_
+
+#include <string>
+
+namespace _CorvaneLogManager {
+
+class PrefStore;
+class ReportScheduler;
+class AppUsageMonitor;
+class PackageMonitor;
+class CrashMonitor;
+class DeviceStatusMonitor;
+class ProviderRegistry;
+class DbManager;
+class UploadDbManager;
+
+// Two process-wide switches, both off until initialisation turns them on. Index 1 gates the
+// report job; nothing reads index 0.
+bool GetRuntimeSwitch(unsigned index);
+void SetRuntimeSwitch(unsigned index, bool on);
+
+class LogManager {
+ public:
+  static LogManager* GetInstance();
+  static void DestroyInstance();
+
+  int Init();
+  int Start();
+  void Stop();
+  void SetName();
+
+  PrefStore* GetPrefStore() const { return prefStore; }
+  ReportScheduler* GetScheduler() const { return scheduler; }
+  bool IsInitialised() const { return initialised; }
+  const std::string& GetName() const { return name; }
+  std::string GetDeviceId() const;
+
+ private:
+  LogManager() = default;
+  ~LogManager() = default;
+  int Construct();
+  void ReleaseMonitors();
+
+  PrefStore* prefStore = nullptr;
+  ReportScheduler* scheduler = nullptr;
+  AppUsageMonitor* appUsageMonitor = nullptr;
+  PackageMonitor* packageMonitor = nullptr;
+  CrashMonitor* crashMonitor = nullptr;
+  DeviceStatusMonitor* deviceStatusMonitor = nullptr;
+  ProviderRegistry* registry = nullptr;
+  DbManager* dbManager = nullptr;
+  UploadDbManager* uploadDbManager = nullptr;
+  std::string name;
+  bool initialised = false;
+};
+
+}  // namespace _CorvaneLogManager
+
+#endif  // LOGMGR_INCLUDE_LOG_MANAGER_H_
