@@ -1,0 +1,49 @@
+// DbConnection: one SQLite database and the few statement operations the daemon uses.
+// Statements run with thread cancellation disabled; a statement interrupted by Interrupt()
+// ends the calling thread, which is how a running report job is stopped from outside.
+#ifndef LOGMGR_INCLUDE_DB_CONNECTION_H_
+#define LOGMGR_INCLUDE_DB_CONNECTION_H_
+
+#include <stdint.h>
+
+struct sqlite3;
+
+namespace _CorvaneLogManager {
+
+class DbConnection {
+ public:
+  DbConnection() = default;
+  ~DbConnection() = default;  // closing is explicit
+
+  // 0 if opened or already open; -1 on failure. The path is a fixed device path.
+  int Open(const char* path);
+  int Exec(const char* sql);
+  // 1 if exactly one schema object of that name exists, else 0.
+  int TableExists(const char* name);
+  // Row count of |table|; 0 on any failure.
+  int Count(const char* table);
+  // Largest timestamp of |table|; 0 on failure or an empty table.
+  int64_t MaxTimestamp(const char* table);
+  // Runs |sql| and renders each row as its columns, each followed by a comma. The row array
+  // has room for Count(table) rows; with a row count above 0 the caller frees each row and
+  // the array (delete[]); with 0 nothing is left to free.
+  int Select(const char* sql, const char* table, int* rowCount, char*** rows);
+  int LastInsertRowId();
+  int Changes();
+  void Interrupt();
+  int Close();
+  void ReportError();
+
+  sqlite3* Handle() const { return db; }
+
+ private:
+  sqlite3* db = nullptr;
+};
+
+// Process-wide encryption switch: off at start and never turned on by the daemon.
+bool GetDbEncryption();
+void SetDbEncryption(bool on);
+
+}  // namespace _CorvaneLogManager
+
+#endif  // LOGMGR_INCLUDE_DB_CONNECTION_H_

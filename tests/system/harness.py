@@ -1,0 +1,155 @@
+"""Shared fixture of the system tests: a simulated device in a fresh temporary sysroot.
+
+A Device has its own private system bus (and Xvfb when asked), runs the real logmgrd and the
+real tools from the build directory, and offers polling waits. Nothing reaches into the daemon:
+tests drive it with vconftool, devsim, logmgrctl, D-Bus and files.
+"""
+import os
+import shutil
+import signal
+import sqlite3
+import subprocess
+import tempfile
+import time
+import unittest
+
+SOURCE_DIR = os.environ.get("LOGMGR_SOURCE_DIR",
+                            os.path.dirname(os.path.dirname(os.path.dirname(
+                                os.path.abspath(__file__)))))
+BUILD_DIR = os.environ.get("LOGMGR_BUILD_DIR", os.path.join(SOURCE_DIR, "build"))
+BIN_DIR = os.path.join(BUILD_DIR, "bin")
+HOST_ENV = os.path.join(SOURCE_DIR, "scripts", "host-env")
+CONSENT_KEY = "db/setting/report_diagnostic_info"
+BUS_NAME = "com.corvane.logmgr"
+DBSPACE = "/opt/usr/dbspace"
+
+
+def wait_for(condition, timeout=10.0, interval=0.02, message="condition"):
+    """Polls |condition| until it returns a true value, which is returned."""
+    deadline = time.monotonic() + timeout
+    while True:
+        value = condition()
+        if value:
+            return value
+        if time.monotonic() > deadline:
+            raise AssertionError(f"timed out after {timeout}s waiting for {message}")
+        time.sleep(interval)
+
+
+class Device:
+    """A simulated device: temp sysroot, private bus, optional Xvfb, the daemon process."""
+
+    def __init__(self, with_x=False):
+        self.sysroot = tempfile.mkdtemp(prefix="logmgr-dev-")
+        args = [HOST_ENV, "start", self.sysroot] + ([] if with_x else ["--no-x"])
+        out = subprocess.run(args, check=True, capture_output=True, text=True).stdout
+        self.env = dict(os.environ)
+        for line in out.splitlines():
+            if line.startswith("export "):
+                key, _, value = line[len("export "):].partition("=")
+                self.env[key] = value
+        if not with_x:
+            self.env.pop("DISPLAY", None)
+        self.daemon = None
+
+    # --- paths and files -------------------------------------------------------------------
+    def path(self, fixed_path):
+        return os.path.join(self.sysroot, fixed_path.lstrip("/"))
+
+    def db_path(self, name):
+        return self.path(os.path.join(DBSPACE, name))
+
+    def query(self, db_name, sql, args=()):
+        """Rows of |sql| on a database of the device, read-only, or [] if the file is absent."""
+        path = self.db_path(db_name)
+        if not os.path.exists(path):
+            return []
+        con = sqlite3.connect(f"file:{path}?mode=ro", uri=True, timeout=5)
+        try:
+            return con.execute(sql, args).fetchall()
+        finally:
+            con.close()
+
+    # --- tools -----------------------------------------------------------------------------
+    def run_tool(self, name, *args, check=True, env=None):
+        return subprocess.run([os.path.join(BIN_DIR, name)] + [str(a) for a in args],
+                              env=env or self.env, capture_output=True, text=True,
+                              check=check, timeout=60)
+
+    def vconf_set(self, key, vtype, value):
+        self.run_tool("vconftool", "set", "-t", vtype, key, value)
+
+    def vconf_get(self, key):
+        r = self.run_tool("vconftool", "get", key, check=False)
+        return r.stdout.strip() if r.returncode == 0 else None
+
+    def set_consent(self, on):
+        self.vconf_set(CONSENT_KEY, "bool", "1" if on else "0")
+
+    def devsim(self, *args, check=True):
+        return self.run_tool("devsim", *args, check=check)
+
+    def dbus_send(self, *args):
+        return subprocess.run(["dbus-send", "--system"] + list(args), env=self.env,
+                              capture_output=True, text=True, timeout=30)
+
+    def name_owner(self, name=BUS_NAME):
+        r = self.dbus_send("--print-reply", "--dest=org.freedesktop.DBus", "/",
+                           "org.freedesktop.DBus.GetNameOwner", f"string:{name}")
+        if r.returncode != 0:
+            return None
+        return r.stdout.strip().splitlines()[-1].split('"')[1]
+
+    def name_queue(self, name=BUS_NAME):
+        r = self.dbus_send("--print-reply", "--dest=org.freedesktop.DBus", "/",
+                           "org.freedesktop.DBus.ListQueuedOwners", f"string:{name}")
+        if r.returncode != 0:
+            return []
+        return [l.split('"')[1] for l in r.stdout.splitlines() if '"' in l]
+
+    # --- the daemon ------------------------------------------------------------------------
+    def start_daemon(self, wait_for_name=True, prefix=(), extra_env=None):
+        env = dict(self.env)
+        env.update(extra_env or {})
+        log = open(os.path.join(self.sysroot, "logmgrd.out"), "ab")
+        proc = subprocess.Popen(list(prefix) + [os.path.join(BIN_DIR, "logmgrd")], env=env,
+                                stdout=log, stderr=log, stdin=subprocess.DEVNULL)
+        log.close()
+        if self.daemon is None:
+            self.daemon = proc
+        if wait_for_name:
+            wait_for(lambda: self.name_owner() is not None or proc.poll() is not None,
+                     message="logmgrd to own its name")
+        return proc
+
+    def wait_exit(self, proc=None, timeout=10.0):
+        proc = proc or self.daemon
+        try:
+            return proc.wait(timeout)
+        except subprocess.TimeoutExpired:
+            raise AssertionError(f"logmgrd did not exit within {timeout}s")
+
+    def wait_started(self, timeout=10.0):
+        """Waits until the deferred start has created the databases."""
+        wait_for(lambda: os.path.exists(self.db_path(".pref.db")), timeout,
+                 message="the daemon's start")
+
+    def signal(self, signum, proc=None):
+        (proc or self.daemon).send_signal(signum)
+
+    def close(self):
+        for proc in [self.daemon]:
+            if proc is not None and proc.poll() is None:
+                proc.send_signal(signal.SIGKILL)
+                proc.wait()
+        subprocess.run([HOST_ENV, "stop", self.sysroot], capture_output=True)
+        shutil.rmtree(self.sysroot, ignore_errors=True)
+
+
+class DeviceTestCase(unittest.TestCase):
+    """Gives every test a fresh device in self.dev; set WITH_X for tests that need X."""
+    WITH_X = False
+
+    def setUp(self):
+        self.dev = Device(with_x=self.WITH_X)
+        self.addCleanup(self.dev.close)
