@@ -1,0 +1,162 @@
+// Host vconf: the key-file format, the sysroot mapping and change notification on the loop.
+#include <glib.h>
+#include <gtest/gtest.h>
+#include <stdlib.h>
+#include <string.h>
+
+#include <fstream>
+#include <string>
+
+#include "vconf.h"
+#include "vconf_store.h"
+
+namespace {
+
+class VconfTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    char tmpl[] = "/tmp/vconf-test-XXXXXX";
+    root_ = mkdtemp(tmpl);
+    setenv("LOGMGR_SYSROOT", root_.c_str(), 1);
+  }
+  void TearDown() override {
+    unsetenv("LOGMGR_SYSROOT");
+    std::string cmd = "rm -rf '" + root_ + "'";
+    (void)system(cmd.c_str());
+  }
+  void WriteRaw(const std::string& rel, const std::string& text) {
+    std::string path = root_ + rel;
+    vconf_store::MakeParentDirs(path);
+    std::ofstream(path) << text;
+  }
+  std::string root_;
+};
+
+TEST_F(VconfTest, ParsesOnlyWellFormedLines) {
+  struct Case {
+    const char* text;
+    bool ok;
+    int type;
+  } cases[] = {
+      {"bool 1\n", true, VCONF_TYPE_BOOL},  {"bool 0", true, VCONF_TYPE_BOOL},
+      {"int -42\n", true, VCONF_TYPE_INT},  {"double 2.5\n", true, VCONF_TYPE_DOUBLE},
+      {"string a b c\n", true, VCONF_TYPE_STRING}, {"string \n", true, VCONF_TYPE_STRING},
+      {"bool 2\n", false, 0},               {"int 12x\n", false, 0},
+      {"int 99999999999\n", false, 0},      {"int  5\n", false, 0},
+      {"double nope\n", false, 0},          {"float 1\n", false, 0},
+      {"int\n", false, 0},                  {"", false, 0},
+      {"string a\nstring b\n", false, 0},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.text);
+    vconf_store::Value v;
+    ASSERT_EQ(vconf_store::Parse(c.text, strlen(c.text), &v), c.ok);
+    if (c.ok) {
+      EXPECT_EQ(v.type, c.type);
+    }
+  }
+}
+
+TEST_F(VconfTest, RoundTripsEveryTypeUnderTheSysroot) {
+  ASSERT_EQ(vconf_set_bool("db/setting/report_diagnostic_info", 1), 0);
+  ASSERT_EQ(vconf_set_int("memory/pm/state", 3), 0);
+  ASSERT_EQ(vconf_set_dbl("db/test/ratio", 0.1), 0);
+  ASSERT_EQ(vconf_set_str("file/test/name", "hello world"), 0);
+
+  int b = -1, i = -1;
+  double d = 0;
+  EXPECT_EQ(vconf_get_bool("db/setting/report_diagnostic_info", &b), 0);
+  EXPECT_EQ(b, 1);
+  EXPECT_EQ(vconf_get_int("memory/pm/state", &i), 0);
+  EXPECT_EQ(i, 3);
+  EXPECT_EQ(vconf_get_dbl("db/test/ratio", &d), 0);
+  EXPECT_EQ(d, 0.1);
+  char* s = vconf_get_str("file/test/name");
+  ASSERT_NE(s, nullptr);
+  EXPECT_STREQ(s, "hello world");
+  free(s);
+
+  // Files land where the device keeps them, beneath the sysroot.
+  std::ifstream pm(root_ + "/var/run/memory/pm/state");
+  std::string line;
+  std::getline(pm, line);
+  EXPECT_EQ(line, "int 3");
+  EXPECT_TRUE(std::ifstream(root_ + "/opt/var/kdb/db/setting/report_diagnostic_info").good());
+
+  // Wrong type, missing key, foreign prefix and escapes all fail without touching outputs.
+  b = 7;
+  EXPECT_EQ(vconf_get_bool("memory/pm/state", &b), -1);
+  EXPECT_EQ(b, 7);
+  EXPECT_EQ(vconf_get_int("memory/absent/key", &i), -1);
+  EXPECT_EQ(vconf_set_int("other/key", 1), -1);
+  EXPECT_EQ(vconf_set_int("db/../../../etc/x", 1), -1);
+  EXPECT_EQ(vconf_set_str("db/test/newline", "a\nb"), -1);
+  WriteRaw("/var/run/memory/garbage", "int twelve\n");
+  EXPECT_EQ(vconf_get_int("memory/garbage", &i), -1);
+}
+
+struct Seen {
+  int calls = 0;
+  int value = -1;
+  std::string name;
+  GMainLoop* loop = nullptr;
+};
+
+void OnChanged(keynode_t* node, void* data) {
+  auto* seen = static_cast<Seen*>(data);
+  ++seen->calls;
+  seen->value = vconf_keynode_get_int(node);
+  seen->name = vconf_keynode_get_name(node);
+  g_main_loop_quit(seen->loop);
+}
+
+gboolean QuitLoop(gpointer loop) {
+  g_main_loop_quit(static_cast<GMainLoop*>(loop));
+  return G_SOURCE_REMOVE;
+}
+
+// Runs the default main context until the callback quits it, bounded so a missing
+// notification fails instead of hanging.
+void RunUntilNotified(Seen* seen) {
+  guint guard = g_timeout_add_seconds(10, QuitLoop, seen->loop);
+  g_main_loop_run(seen->loop);
+  g_source_remove(guard);
+}
+
+TEST_F(VconfTest, KeyFileChangesReachTheCallbackOnTheMainContext) {
+  Seen seen;
+  seen.loop = g_main_loop_new(nullptr, FALSE);
+  ASSERT_EQ(vconf_notify_key_changed("memory/sysman/earjack", OnChanged, &seen), 0);
+
+  ASSERT_EQ(vconf_set_int("memory/sysman/earjack", 1), 0);
+  RunUntilNotified(&seen);
+  EXPECT_EQ(seen.calls, 1);
+  EXPECT_EQ(seen.value, 1);
+  EXPECT_EQ(seen.name, "memory/sysman/earjack");
+
+  // The same value again still notifies; a plain rewrite by another tool does too.
+  ASSERT_EQ(vconf_set_int("memory/sysman/earjack", 1), 0);
+  RunUntilNotified(&seen);
+  EXPECT_EQ(seen.calls, 2);
+  WriteRaw("/var/run/memory/sysman/earjack", "int 0\n");
+  RunUntilNotified(&seen);
+  EXPECT_EQ(seen.calls, 3);
+  EXPECT_EQ(seen.value, 0);
+
+  // Garbage is skipped; the next good value still arrives, and a sibling key does not count.
+  WriteRaw("/var/run/memory/sysman/earjack", "int garbage\n");
+  while (g_main_context_iteration(nullptr, FALSE)) {
+  }
+  EXPECT_EQ(seen.calls, 3);
+  ASSERT_EQ(vconf_set_int("memory/sysman/usb_status", 2), 0);
+  ASSERT_EQ(vconf_set_int("memory/sysman/earjack", 3), 0);
+  RunUntilNotified(&seen);
+  EXPECT_EQ(seen.calls, 4);
+  EXPECT_EQ(seen.value, 3);
+
+  EXPECT_EQ(vconf_ignore_key_changed("memory/sysman/earjack", OnChanged), 0);
+  EXPECT_EQ(vconf_ignore_key_changed("memory/sysman/earjack", OnChanged), -1);
+  g_main_loop_unref(seen.loop);
+}
+
+}  // namespace
