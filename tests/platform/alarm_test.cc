@@ -1,0 +1,85 @@
+// Host alarms fire on the GLib main context at their local time, then every interval.
+#include <glib.h>
+#include <gtest/gtest.h>
+#include <time.h>
+
+#include <vector>
+
+#include "alarm.h"
+
+namespace {
+
+struct Fired {
+  std::vector<alarm_id_t> ids;
+  std::vector<time_t> at;
+  GMainLoop* loop = nullptr;
+  size_t quit_after = 0;
+};
+
+int OnAlarm(alarm_id_t id, void* data) {
+  auto* fired = static_cast<Fired*>(data);
+  fired->ids.push_back(id);
+  fired->at.push_back(time(nullptr));
+  if (fired->ids.size() >= fired->quit_after) g_main_loop_quit(fired->loop);
+  return 0;
+}
+
+gboolean GiveUp(gpointer loop) {
+  g_main_loop_quit(static_cast<GMainLoop*>(loop));
+  return G_SOURCE_REMOVE;
+}
+
+alarm_entry_t* RepeatingEntryAt(time_t when, int interval) {
+  struct tm tm;
+  localtime_r(&when, &tm);
+  alarm_entry_t* entry = alarmmgr_create_alarm();
+  alarm_date_t date = {tm.tm_year + 1900, tm.tm_mon + 1, tm.tm_mday,
+                       tm.tm_hour,        tm.tm_min,     tm.tm_sec};
+  EXPECT_EQ(alarmmgr_set_time(entry, date), 0);
+  EXPECT_EQ(alarmmgr_set_repeat_mode(entry, ALARM_REPEAT_MODE_REPEAT, interval), 0);
+  EXPECT_EQ(alarmmgr_set_type(entry, ALARM_TYPE_VOLATILE), 0);
+  return entry;
+}
+
+TEST(AlarmTest, RepeatsAtItsIntervalAndStopsWhenRemoved) {
+  Fired fired;
+  fired.loop = g_main_loop_new(nullptr, FALSE);
+  fired.quit_after = 2;
+  alarm_id_t id = 0;
+  alarm_entry_t* entry = RepeatingEntryAt(time(nullptr) + 1, 1);
+  EXPECT_NE(alarmmgr_add_alarm_with_localtime(entry, nullptr, &id), 0);  // not initialised
+
+  ASSERT_EQ(alarmmgr_init("com.corvane.test"), 0);
+  ASSERT_EQ(alarmmgr_set_cb(OnAlarm, &fired), 0);
+  time_t start = time(nullptr);
+  ASSERT_EQ(alarmmgr_add_alarm_with_localtime(entry, nullptr, &id), 0);
+  ASSERT_EQ(alarmmgr_free_alarm(entry), 0);  // the manager keeps its own copy
+
+  guint guard = g_timeout_add_seconds(10, GiveUp, fired.loop);
+  g_main_loop_run(fired.loop);
+  g_source_remove(guard);
+
+  ASSERT_EQ(fired.ids.size(), 2u);
+  EXPECT_EQ(fired.ids[0], id);
+  EXPECT_EQ(fired.ids[1], id);
+  EXPECT_GE(fired.at[0], start + 1);  // not before its local time
+  EXPECT_GE(fired.at[1], fired.at[0] + 1);
+
+  EXPECT_EQ(alarmmgr_remove_alarm(id), 0);
+  EXPECT_EQ(alarmmgr_remove_alarm(id), ERR_ALARM_INVALID_ID);
+  EXPECT_EQ(alarmmgr_remove_alarm(id + 100), ERR_ALARM_INVALID_ID);
+  alarmmgr_fini();
+  g_main_loop_unref(fired.loop);
+}
+
+TEST(AlarmTest, RejectsInvalidSettings) {
+  alarm_entry_t* entry = alarmmgr_create_alarm();
+  alarm_date_t bad = {2026, 13, 1, 0, 0, 0};
+  EXPECT_EQ(alarmmgr_set_time(entry, bad), ERR_ALARM_INVALID_DATE);
+  EXPECT_EQ(alarmmgr_set_repeat_mode(entry, ALARM_REPEAT_MODE_REPEAT, 0), ERR_ALARM_INVALID_REPEAT);
+  EXPECT_EQ(alarmmgr_set_type(entry, 0x100), ERR_ALARM_INVALID_TYPE);
+  EXPECT_EQ(alarmmgr_init(""), ERR_ALARM_INVALID_PARAM);
+  EXPECT_EQ(alarmmgr_free_alarm(entry), 0);
+}
+
+}  // namespace
