@@ -1,6 +1,7 @@
 // Host alarms fire on the GLib main context at their local time, then every interval.
 #include <glib.h>
 #include <gtest/gtest.h>
+#include <sys/time.h>
 #include <time.h>
 
 #include <vector>
@@ -8,6 +9,13 @@
 #include "alarm.h"
 
 namespace {
+
+// gettimeofday, not time(): time() reads the coarse clock, which may still show the last second.
+time_t Now() {
+  struct timeval tv;
+  gettimeofday(&tv, nullptr);
+  return tv.tv_sec;
+}
 
 struct Fired {
   std::vector<alarm_id_t> ids;
@@ -19,7 +27,7 @@ struct Fired {
 int OnAlarm(alarm_id_t id, void* data) {
   auto* fired = static_cast<Fired*>(data);
   fired->ids.push_back(id);
-  fired->at.push_back(time(nullptr));
+  fired->at.push_back(Now());
   if (fired->ids.size() >= fired->quit_after) g_main_loop_quit(fired->loop);
   return 0;
 }
@@ -46,7 +54,7 @@ TEST(AlarmTest, RepeatsAtItsIntervalAndStopsWhenRemoved) {
   fired.loop = g_main_loop_new(nullptr, FALSE);
   fired.quit_after = 2;
   alarm_id_t id = 0;
-  time_t target = time(nullptr) + 1;
+  time_t target = Now() + 1;
   alarm_entry_t* entry = RepeatingEntryAt(target, 1);
   EXPECT_NE(alarmmgr_add_alarm_with_localtime(entry, nullptr, &id), 0);  // not initialised
 
