@@ -10,6 +10,9 @@
 
 namespace _CorvaneLogManager {
 
+class DbConnection;
+
+// What a database manager keeps of the providers whose tables live in its file.
 class IDbResponseListener {
  public:
   virtual ~IDbResponseListener() {}
@@ -24,12 +27,16 @@ struct TableConfig {
   int32_t insert_counter = 0;
 };
 
+// Column and value lists are comma-separated texts; values are SQL literals as the caller
+// wants them (strings already quoted). timestamp and time_zone are appended here, never by
+// the caller. Row texts of selects are QueryResult rows (see DbConnection::Select).
 class BaseLogProvider : public IDbResponseListener {
  public:
   BaseLogProvider() = default;
   ~BaseLogProvider() override = default;
 
   // The order of these virtual operations is part of the design.
+  // Creates the table; returns the reseeded insert counter (0..499) or -1.
   virtual int Initialize();
   virtual void EmptyHook() {}
   virtual int DeleteExpiredRows();
@@ -38,10 +45,12 @@ class BaseLogProvider : public IDbResponseListener {
                          int32_t* count = nullptr);
   virtual int SelectRows(const char* columns, const char* where, const char* orderBy,
                          int* rowCount, char*** rows);
+  // Note the argument order: ORDER BY before GROUP BY (the statement places GROUP BY first).
   virtual int SelectGroupedRows(const char* columns, const char* where, const char* orderBy,
                                 const char* groupBy, int* rowCount, char*** rows);
   virtual int DeleteRows(const char* where, int32_t* count = nullptr);
   virtual const char* GetCreateTableSql() = 0;
+  // The registry name; equals the table name except for the upload queue.
   virtual const char* GetTableName() = 0;
   virtual int GetRowCount();
   virtual int DeleteOldestRows();
@@ -49,12 +58,23 @@ class BaseLogProvider : public IDbResponseListener {
   const TableConfig& Config() const { return config; }
 
  protected:
+  // List texts of 200 bytes or more end the process.
   int InitTableConfig(const char* tableName, const char* columnList, int32_t retentionDays,
                       int32_t checkInterval, int32_t maxRows, int32_t initialCounter);
   int ValidateColumns(const char* columnList);
   void AppendAutoColumns(std::string* columns, std::string* values);
   int32_t AdvanceInsertCounter();
   int32_t TickInsertCounter();
+
+  // The statements themselves, on a given connection (null: no connection), so that a
+  // provider living in another database file reuses them.
+  int InsertOn(DbConnection* conn, const char* columns, const char* values, int32_t* rowId,
+               bool countRows);
+  // |splitDelims| is where the two lists are cut into tokens before pairing.
+  int UpdateOn(DbConnection* conn, const char* columns, const char* values, const char* where,
+               int32_t* count, bool autoColumns, const char* splitDelims);
+  int DeleteOn(DbConnection* conn, const char* where, int32_t* count);
+  int DeleteOldestOn(DbConnection* conn);
 
   TableConfig config;
 };

@@ -2,9 +2,20 @@
 #ifndef LOGMGR_INCLUDE_PROVIDER_REGISTRY_H_
 #define LOGMGR_INCLUDE_PROVIDER_REGISTRY_H_
 
+#include <stddef.h>
+
+#include <map>
+#include <string>
+
 namespace _CorvaneLogManager {
 
 class BaseLogProvider;
+class UseAppSurveyLogProvider;
+class ManageAppSurveyLogProvider;
+class UseAppFeatureSurveyLogProvider;
+class ReportAppStatusSurveyLogProvider;
+class AppErrorSurveyLogProvider;
+class ServerUploadLogProvider;
 
 class ProviderRegistry {
  public:
@@ -12,8 +23,27 @@ class ProviderRegistry {
   // Tears the registry down, frees it and resets the singleton.
   static void Release();
 
+  // Builds the six providers and adds each to its database manager; call before the
+  // managers' Init so every table gets created. 0 / -1.
   int CreateProviders();
+  // Keys: "use_app_survey", "use_app_feature_survey", "report_app_status_survey",
+  // "report_app_error_survey", "manage_app_survey", "server_upload". An unknown name is
+  // remembered with a null provider (map subscript); callers test for null.
   BaseLogProvider* Lookup(const char* name);
+  size_t EntryCount() const { return providers.size(); }
+
+ private:
+  ProviderRegistry() = default;
+  ~ProviderRegistry();
+  void Teardown();
+
+  std::map<std::string, BaseLogProvider*> providers;
+  UseAppSurveyLogProvider* useApp = nullptr;
+  UseAppFeatureSurveyLogProvider* useAppFeature = nullptr;
+  ReportAppStatusSurveyLogProvider* reportAppStatus = nullptr;
+  AppErrorSurveyLogProvider* appError = nullptr;
+  ManageAppSurveyLogProvider* manageApp = nullptr;
+  ServerUploadLogProvider* serverUpload = nullptr;
 };
 
 }  // namespace _CorvaneLogManager

@@ -19,6 +19,7 @@ void ProviderRegistry::Release() {
   g_registry = nullptr;
 }
 
+ProviderRegistry::~ProviderRegistry() {}
 int ProviderRegistry::CreateProviders() { return 0; }
 BaseLogProvider* ProviderRegistry::Lookup(const char*) { return nullptr; }
 

@@ -21,6 +21,11 @@ void DbManager::CloseInstance() {
 }
 
 int DbManager::Init() { return 0; }
+DbManager::~DbManager() {}
+void DbManager::AddListener(IDbResponseListener* l) { listeners.push_back(l); }
+void DbManager::RemoveListener(IDbResponseListener*) {}
+int DbManager::NotifyInitialize() { return 0; }
+int DbManager::NotifyDeleteExpired() { return 0; }
 
 UploadDbManager* UploadDbManager::GetInstance() {
   if (g_uploadDbManager == nullptr) g_uploadDbManager = new (std::nothrow) UploadDbManager();
@@ -33,5 +38,9 @@ void UploadDbManager::CloseInstance() {
 }
 
 int UploadDbManager::Init() { return 0; }
+UploadDbManager::~UploadDbManager() {}
+void UploadDbManager::AddListener(IDbResponseListener* l) { listeners.push_back(l); }
+void UploadDbManager::RemoveListener(IDbResponseListener*) {}
+int UploadDbManager::NotifyInitialize() { return 0; }
 
 }  // namespace _CorvaneLogManager
