@@ -1,0 +1,98 @@
+#include "storage/status_snapshot_store.h"
+
+#include <limits.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+
+#include <new>
+
+#include "db_connection.h"
+#include "platform/fixed_path.h"
+
+namespace _CorvaneLogManager {
+
+namespace {
+
+const char* const kDbPath = "/opt/usr/dbspace/.StatusMonitor.db";
+const char* const kTable = "survey_status_monitor";
+const char* const kCreateSql =
+    "CREATE TABLE IF NOT EXISTS survey_status_monitor (feature TEXT NOT NULL UNIQUE,extra "
+    "TEXT,timestamp INTEGER);";
+
+StatusSnapshotStore* g_store = nullptr;
+
+}  // namespace
+
+StatusSnapshotStore* StatusSnapshotStore::GetInstance() {
+  if (g_store != nullptr) return g_store;
+  StatusSnapshotStore* store = new (std::nothrow) StatusSnapshotStore();
+  if (store == nullptr) return nullptr;
+  // Registered before opening: a failed open still leaves this instance for later callers,
+  // who tolerate its failing operations. Deliberate.
+  g_store = store;
+  store->connection = new (std::nothrow) DbConnection();
+  if (store->connection == nullptr) return nullptr;
+  char buf[PATH_MAX];
+  if (store->connection->Open(logmgr_fixed_path(kDbPath, buf, sizeof(buf))) != 0) return nullptr;
+  if (store->connection->Exec(kCreateSql) != 0) return nullptr;
+  return store;
+}
+
+void StatusSnapshotStore::DestroyInstance() {
+  delete g_store;
+  g_store = nullptr;
+}
+
+StatusSnapshotStore::~StatusSnapshotStore() {
+  if (connection != nullptr) {
+    (void)connection->Close();
+    delete connection;
+  }
+}
+
+int StatusSnapshotStore::Put(const char* feature, const char* extra, int64_t timestamp) {
+  if (feature == nullptr || feature[0] == '\0' || connection == nullptr) return -1;
+  char sql[1024];
+  // Texts go in unescaped: a quote in them breaks the statement, which then fails.
+  (void)snprintf(sql, sizeof(sql),
+                 "INSERT OR REPLACE INTO survey_status_monitor VALUES('%s','%s',%lld);", feature,
+                 extra != nullptr ? extra : "", static_cast<long long>(timestamp));
+  return connection->Exec(sql) == 0 ? 0 : -1;
+}
+
+int StatusSnapshotStore::Get(const char* feature, std::string* extraOut, int64_t* timestampOut) {
+  if (feature == nullptr || feature[0] == '\0' || connection == nullptr) return -1;
+  char sql[1024];
+  (void)snprintf(sql, sizeof(sql),
+                 "SELECT extra,timestamp FROM survey_status_monitor WHERE feature = '%s';",
+                 feature);
+  int rowCount = 0;
+  char** rows = nullptr;
+  if (connection->Select(sql, kTable, &rowCount, &rows) != 0) return -1;
+  if (rowCount <= 0) {
+    *extraOut = "";
+    *timestampOut = 0;
+    return 0;
+  }
+  // The row reads "extra,timestamp,": no escaping, so an extra holding "," is cut there.
+  const char* row = rows[0] != nullptr ? rows[0] : "";
+  const char* comma = strchr(row, ',');
+  if (comma == nullptr) {
+    extraOut->assign(row);
+    *timestampOut = 0;
+  } else {
+    extraOut->assign(row, comma - row);
+    *timestampOut = strtoll(comma + 1, nullptr, 10);
+  }
+  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
+  delete[] rows;
+  return 0;
+}
+
+int64_t StatusSnapshotStore::LatestTimestamp() {
+  if (connection == nullptr) return 0;
+  return connection->MaxTimestamp(kTable);
+}
+
+}  // namespace _CorvaneLogManager
