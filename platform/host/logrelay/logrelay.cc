@@ -1,0 +1,155 @@
+// Host log relay: register appends the record as one JSON line to the outbox
+// ($SYSROOT/opt/usr/data/log-relay/outbox.jsonl), keys the item numbers as text.
+// LOGRELAY_FAIL="register:N[,create:N][,set:N]" makes the N-th such call of the process fail,
+// so tests can break a hand-over at any position.
+#include <errno.h>
+#include <fcntl.h>
+#include <stdint.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <map>
+#include <new>
+#include <string>
+
+#include "corvane_log_relay.h"
+#include "fixed_path.h"
+
+#define RELAY_API extern "C" __attribute__((visibility("default")))
+
+struct corvane_log_item {
+  std::map<int, std::string> texts;  // item number -> text
+  bool hasTime = false;
+  int64_t timeMs = 0;
+};
+
+namespace {
+
+constexpr char kOutboxDir[] = "/opt/usr/data/log-relay";
+constexpr char kOutbox[] = "/opt/usr/data/log-relay/outbox.jsonl";
+
+std::atomic<long> g_creates{0};
+std::atomic<long> g_sets{0};
+std::atomic<long> g_registers{0};
+
+// True when this call (its 1-based number |call|) is the one LOGRELAY_FAIL names for |kind|.
+bool InjectedFailure(const char* kind, long call) {
+  const char* spec = getenv("LOGRELAY_FAIL");
+  if (spec == nullptr) return false;
+  size_t kindLen = strlen(kind);
+  for (const char* p = spec; *p != '\0';) {
+    const char* end = strchr(p, ',');
+    size_t len = end ? static_cast<size_t>(end - p) : strlen(p);
+    if (len > kindLen + 1 && strncmp(p, kind, kindLen) == 0 && p[kindLen] == ':' &&
+        strtol(p + kindLen + 1, nullptr, 10) == call) {
+      return true;
+    }
+    p += len + (end ? 1 : 0);
+  }
+  return false;
+}
+
+void AppendJsonString(std::string* out, const std::string& text) {
+  out->push_back('"');
+  for (unsigned char c : text) {
+    switch (c) {
+      case '"': *out += "\\\""; break;
+      case '\\': *out += "\\\\"; break;
+      case '\n': *out += "\\n"; break;
+      case '\r': *out += "\\r"; break;
+      case '\t': *out += "\\t"; break;
+      default:
+        if (c < 0x20) {
+          char esc[8];
+          snprintf(esc, sizeof(esc), "\\u%04x", c);
+          *out += esc;
+        } else {
+          out->push_back(static_cast<char>(c));
+        }
+    }
+  }
+  out->push_back('"');
+}
+
+int MakeDirs(const char* fixedDir) {
+  char buf[4096];
+  std::string path = logmgr_fixed_path(fixedDir, buf, sizeof(buf));
+  for (size_t i = 1; i <= path.size(); ++i) {
+    if (i == path.size() || path[i] == '/') {
+      std::string part = path.substr(0, i);
+      if (mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) return -1;
+    }
+  }
+  return 0;
+}
+
+}  // namespace
+
+RELAY_API int corvane_log_relay_mobile_create_log_item_handle(corvane_log_item_h* handle) {
+  if (handle == nullptr) return CORVANE_LOG_RELAY_ERROR_INVALID_PARAMETER;
+  if (InjectedFailure("create", ++g_creates)) {
+    *handle = nullptr;
+    return CORVANE_LOG_RELAY_ERROR_IO;
+  }
+  *handle = new (std::nothrow) corvane_log_item();
+  return *handle == nullptr ? CORVANE_LOG_RELAY_ERROR_OUT_OF_MEMORY : CORVANE_LOG_RELAY_ERROR_NONE;
+}
+
+RELAY_API int corvane_log_relay_mobile_set_log_item(corvane_log_item_h handle, int item,
+                                                    const void* value) {
+  if (InjectedFailure("set", ++g_sets)) return CORVANE_LOG_RELAY_ERROR_IO;
+  if (handle == nullptr || value == nullptr || item < CORVANE_LOG_ITEM_LOG_TYPE ||
+      item > CORVANE_LOG_ITEM_APP_ID) {
+    return CORVANE_LOG_RELAY_ERROR_INVALID_PARAMETER;
+  }
+  if (item == CORVANE_LOG_ITEM_TIME) {
+    handle->hasTime = true;
+    memcpy(&handle->timeMs, value, sizeof(handle->timeMs));
+  } else {
+    handle->texts[item] = static_cast<const char*>(value);
+  }
+  return CORVANE_LOG_RELAY_ERROR_NONE;
+}
+
+RELAY_API int corvane_log_relay_mobile_register_log_item(corvane_log_item_h handle) {
+  if (InjectedFailure("register", ++g_registers)) return CORVANE_LOG_RELAY_ERROR_IO;
+  if (handle == nullptr) return CORVANE_LOG_RELAY_ERROR_INVALID_PARAMETER;
+
+  std::string line = "{";
+  for (int item = CORVANE_LOG_ITEM_LOG_TYPE; item <= CORVANE_LOG_ITEM_APP_ID; ++item) {
+    std::string value;
+    if (item == CORVANE_LOG_ITEM_TIME) {
+      if (!handle->hasTime) continue;
+      value = std::to_string(static_cast<long long>(handle->timeMs));
+    } else {
+      auto it = handle->texts.find(item);
+      if (it == handle->texts.end()) continue;
+      AppendJsonString(&value, it->second);
+    }
+    if (line.size() > 1) line += ", ";
+    line += "\"" + std::to_string(item) + "\": " + value;
+  }
+  line += "}\n";
+
+  if (MakeDirs(kOutboxDir) != 0) return CORVANE_LOG_RELAY_ERROR_IO;
+  char buf[4096];
+  int fd = open(logmgr_fixed_path(kOutbox, buf, sizeof(buf)),
+                O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+  if (fd < 0) return CORVANE_LOG_RELAY_ERROR_IO;
+  // One write under O_APPEND keeps concurrent writers' lines whole.
+  ssize_t written = write(fd, line.data(), line.size());
+  int synced = fsync(fd);
+  close(fd);
+  if (written != static_cast<ssize_t>(line.size()) || synced != 0) return CORVANE_LOG_RELAY_ERROR_IO;
+  return CORVANE_LOG_RELAY_ERROR_NONE;
+}
+
+RELAY_API int corvane_log_relay_mobile_free_log_item(corvane_log_item_h handle) {
+  if (handle == nullptr) return CORVANE_LOG_RELAY_ERROR_INVALID_PARAMETER;
+  delete handle;
+  return CORVANE_LOG_RELAY_ERROR_NONE;
+}
