@@ -1,0 +1,114 @@
+// DeviceStatusMonitor periods on the real store, registry and survey database in a temp sysroot.
+#include "collectors/device_status_monitor.h"
+
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+#include <stdlib.h>
+
+#include <string>
+
+#include "log_manager.h"
+#include "provider_registry.h"
+#include "storage/db_manager.h"
+#include "storage/status_snapshot_store.h"
+
+namespace _CorvaneLogManager {
+namespace {
+
+class DeviceStatusMonitorTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    char tmpl[] = "/tmp/logmgr-device-XXXXXX";
+    ASSERT_NE(mkdtemp(tmpl), nullptr);
+    sysroot = tmpl;
+    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
+    ASSERT_EQ(system(("mkdir -p '" + sysroot + "/opt/usr/dbspace'").c_str()), 0);
+    LogManager* manager = LogManager::GetInstance();
+    ASSERT_NE(manager, nullptr);
+    manager->SetName();
+    ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
+    ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
+    // No display, charger or headset keys: recovery takes the store and samples nothing.
+    ASSERT_EQ(monitor.Recover(), 0);
+    store = StatusSnapshotStore::GetInstance();
+    ASSERT_NE(store, nullptr);
+  }
+  void TearDown() override {
+    ProviderRegistry::Release();
+    DbManager::CloseInstance();
+    StatusSnapshotStore::DestroyInstance();
+    LogManager::GetInstance()->Stop();
+    LogManager::DestroyInstance();
+    unsetenv("LOGMGR_SYSROOT");
+    (void)system(("rm -rf '" + sysroot + "'").c_str());
+  }
+  // Feature rows as "app|feature|extra|value;" in insertion order.
+  std::string Rows() {
+    sqlite3* db = nullptr;
+    std::string path = sysroot + "/opt/usr/dbspace/.SurveyLog.db";
+    EXPECT_EQ(sqlite3_open_v2(path.c_str(), &db, SQLITE_OPEN_READONLY, nullptr), SQLITE_OK);
+    sqlite3_stmt* stmt = nullptr;
+    sqlite3_prepare_v2(db,
+                       "SELECT app_id, feature, extra, value FROM use_app_feature_survey "
+                       "ORDER BY _id",
+                       -1, &stmt, nullptr);
+    std::string out;
+    while (sqlite3_step(stmt) == SQLITE_ROW) {
+      for (int i = 0; i < 4; ++i) {
+        const unsigned char* text = sqlite3_column_text(stmt, i);
+        out += text != nullptr ? reinterpret_cast<const char*>(text) : "NULL";
+        out += i < 3 ? "|" : ";";
+      }
+    }
+    sqlite3_finalize(stmt);
+    sqlite3_close(db);
+    return out;
+  }
+  int64_t OpenedAt(const char* code) {
+    std::string extra;
+    int64_t ts = -1;
+    EXPECT_EQ(store->Get(code, &extra, &ts), 0);
+    return ts;
+  }
+
+  std::string sysroot;
+  DeviceStatusMonitor monitor;
+  StatusSnapshotStore* store = nullptr;
+};
+
+TEST_F(DeviceStatusMonitorTest, WritesOnlyPeriodsOfPlausibleLength) {
+  struct Case {
+    int64_t duration;
+    bool written;
+  } cases[] = {{-5, false}, {0, false}, {1, true}, {604800000LL, true}, {604800001LL, false}};
+  std::string expected;
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.duration);
+    ASSERT_EQ(monitor.StartFeature("WIFI", ""), 0);
+    int64_t start = OpenedAt("WIFI");
+    ASSERT_GT(start, 0);
+    ASSERT_EQ(monitor.EndFeature("WIFI", start + c.duration), 0);
+    if (c.written) expected += "com.corvane.logmanager|WIFI||" + std::to_string(c.duration) + ";";
+    EXPECT_EQ(Rows(), expected);
+    EXPECT_EQ(OpenedAt("WIFI"), 0);  // closed either way
+  }
+}
+
+TEST_F(DeviceStatusMonitorTest, FirstStartWinsAndClosingTwiceWritesOnce) {
+  ASSERT_EQ(monitor.StartFeature("BLUE", "1025"), 0);
+  int64_t start = OpenedAt("BLUE");
+  ASSERT_EQ(monitor.StartFeature("BLUE", "515"), 0);
+  EXPECT_EQ(OpenedAt("BLUE"), start);
+  ASSERT_EQ(monitor.EndFeature("BLUE", start + 2500), 0);
+  ASSERT_EQ(monitor.EndFeature("BLUE", start + 5000), 0);
+  ASSERT_EQ(monitor.RecordCapture(), 0);
+  EXPECT_EQ(Rows(), "com.corvane.logmanager|BLUE|1025|2500;com.corvane.logmanager|CAPT||NULL;");
+
+  // Without the store taken by recovery a monitor refuses periods.
+  DeviceStatusMonitor fresh;
+  EXPECT_EQ(fresh.StartFeature("HEAD", ""), -1);
+  EXPECT_EQ(fresh.EndFeature("HEAD", start), -1);
+}
+
+}  // namespace
+}  // namespace _CorvaneLogManager

@@ -1,0 +1,118 @@
+// StatusSnapshotStore on a real database file in a temp sysroot.
+#include "storage/status_snapshot_store.h"
+
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+#include <stdlib.h>
+#include <sys/stat.h>
+
+#include <string>
+
+namespace _CorvaneLogManager {
+namespace {
+
+class StatusSnapshotStoreTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    char tmpl[] = "/tmp/logmgr-snapshot-XXXXXX";
+    ASSERT_NE(mkdtemp(tmpl), nullptr);
+    sysroot = tmpl;
+    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
+  }
+  void TearDown() override {
+    StatusSnapshotStore::DestroyInstance();
+    unsetenv("LOGMGR_SYSROOT");
+    (void)system(("rm -rf '" + sysroot + "'").c_str());
+  }
+  StatusSnapshotStore* Open() {
+    std::string dir = sysroot + "/opt/usr/dbspace";
+    (void)system(("mkdir -p '" + dir + "'").c_str());
+    return StatusSnapshotStore::GetInstance();
+  }
+  // Rows as stored, read past the store: "feature|extra|timestamp;" each.
+  std::string Dump() {
+    sqlite3* db = nullptr;
+    std::string path = sysroot + "/opt/usr/dbspace/.StatusMonitor.db";
+    EXPECT_EQ(sqlite3_open_v2(path.c_str(), &db, SQLITE_OPEN_READONLY, nullptr), SQLITE_OK);
+    sqlite3_stmt* stmt = nullptr;
+    std::string out;
+    sqlite3_prepare_v2(db,
+                       "SELECT feature, extra, timestamp FROM survey_status_monitor "
+                       "ORDER BY feature",
+                       -1, &stmt, nullptr);
+    while (sqlite3_step(stmt) == SQLITE_ROW) {
+      out += reinterpret_cast<const char*>(sqlite3_column_text(stmt, 0));
+      out += "|";
+      out += reinterpret_cast<const char*>(sqlite3_column_text(stmt, 1));
+      out += "|" + std::to_string(sqlite3_column_int64(stmt, 2)) + ";";
+    }
+    sqlite3_finalize(stmt);
+    sqlite3_close(db);
+    return out;
+  }
+  std::string sysroot;
+};
+
+TEST_F(StatusSnapshotStoreTest, KeepsOneRowPerFeature) {
+  StatusSnapshotStore* store = Open();
+  ASSERT_NE(store, nullptr);
+  std::string extra = "unchanged";
+  int64_t ts = -5;
+  ASSERT_EQ(store->Get("SCRN", &extra, &ts), 0);
+  EXPECT_EQ(extra, "");
+  EXPECT_EQ(ts, 0);
+
+  ASSERT_EQ(store->Put("BLUE", "1025", 1700000000123LL), 0);
+  ASSERT_EQ(store->Put("BLUE", "515", 1700000000999LL), 0);
+  ASSERT_EQ(store->Put("SCRN", "", 1700000000500LL), 0);
+  EXPECT_EQ(Dump(), "BLUE|515|1700000000999;SCRN||1700000000500;");
+  ASSERT_EQ(store->Get("BLUE", &extra, &ts), 0);
+  EXPECT_EQ(extra, "515");
+  EXPECT_EQ(ts, 1700000000999LL);
+  ASSERT_EQ(store->Get("SCRN", &extra, &ts), 0);
+  EXPECT_EQ(extra, "");
+  EXPECT_EQ(ts, 1700000000500LL);
+  EXPECT_EQ(store->LatestTimestamp(), 1700000000999LL);
+
+  // Closing a period is a write of "" and 0.
+  ASSERT_EQ(store->Put("BLUE", "", 0), 0);
+  ASSERT_EQ(store->Get("BLUE", &extra, &ts), 0);
+  EXPECT_EQ(extra, "");
+  EXPECT_EQ(ts, 0);
+  EXPECT_EQ(store->LatestTimestamp(), 1700000000500LL);
+}
+
+TEST_F(StatusSnapshotStoreTest, RejectsWhatTheStatementCannotCarry) {
+  StatusSnapshotStore* store = Open();
+  ASSERT_NE(store, nullptr);
+  ASSERT_EQ(store->Put("HEAD", "", 42), 0);
+  std::string extra = "kept";
+  int64_t ts = 7;
+  EXPECT_EQ(store->Put("", "x", 1), -1);
+  EXPECT_EQ(store->Get("", &extra, &ts), -1);
+  EXPECT_EQ(extra, "kept");
+  EXPECT_EQ(ts, 7);
+  EXPECT_EQ(store->Put("HEAD", "it's", 99), -1);  // the quote breaks the statement
+  EXPECT_EQ(Dump(), "HEAD||42;");
+
+  // No escaping: an extra with a comma reads back cut, the next field as the timestamp.
+  ASSERT_EQ(store->Put("CHAR", "U,12,x", 500), 0);
+  ASSERT_EQ(store->Get("CHAR", &extra, &ts), 0);
+  EXPECT_EQ(extra, "U");
+  EXPECT_EQ(ts, 12);
+}
+
+TEST_F(StatusSnapshotStoreTest, StaysRegisteredWhenTheFileCannotBeOpened) {
+  // No dbspace directory: the open fails, yet the instance remains for later calls.
+  EXPECT_EQ(StatusSnapshotStore::GetInstance(), nullptr);
+  StatusSnapshotStore* again = StatusSnapshotStore::GetInstance();
+  ASSERT_NE(again, nullptr);
+  std::string extra;
+  int64_t ts = 0;
+  EXPECT_EQ(again->Put("SCRN", "", 1), -1);
+  EXPECT_EQ(again->Get("SCRN", &extra, &ts), -1);
+  EXPECT_EQ(again->LatestTimestamp(), 0);
+}
+
+}  // namespace
+}  // namespace _CorvaneLogManager
