@@ -13,5 +13,8 @@ int PrefStore::Create() { return 0; }
 int PrefStore::Close() { return 0; }
 int PrefStore::SetLastShutdownTime(int32_t) { return 0; }
 uint32_t PrefStore::GetLastShutdownTime() { return 0; }
+int PrefStore::SetSentDate(int32_t) { return -1; }
+uint32_t PrefStore::GetSentDate() { return 0; }
+uint32_t PrefStore::NormaliseSentDate() { return 0; }
 
 }  // namespace _CorvaneLogManager

@@ -25,6 +25,11 @@ class PrefStore {
 
   int SetLastShutdownTime(int32_t seconds);
   uint32_t GetLastShutdownTime();
+  // key_sent_date (seconds): get gives 0 on failure; normalise rounds it to the nearest local
+  // midnight, stores it back and returns it (0 when unreadable).
+  int SetSentDate(int32_t seconds);
+  uint32_t GetSentDate();
+  uint32_t NormaliseSentDate();
 
  private:
   DbConnection* connection = nullptr;

@@ -1,0 +1,191 @@
+// Reporting cost: a full daily run at the table limits against bare SQLite running the same
+// GROUP BY queries, and the hand-over of one batch of 1000 queued records.
+#include <benchmark/benchmark.h>
+#include <sqlite3.h>
+#include <stdlib.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <string>
+
+#include "db_connection.h"
+#include "log_manager.h"
+#include "provider_registry.h"
+#include "reporting/report_builder.h"
+#include "reporting/uploader.h"
+#include "storage/db_manager.h"
+#include "storage/pref_store.h"
+
+// Needs the real database connection; built once the storage layer provides it.
+#if __has_include("storage/db_connection.cc")
+
+namespace _CorvaneLogManager {
+namespace {
+
+constexpr int kRowsPerTable = 5000;  // the survey tables' row limit
+int64_t g_nowMs = 0;
+int64_t BenchClock() { return g_nowMs; }
+
+time_t LocalMidnight(int year, int month, int day) {
+  struct tm tm = {};
+  tm.tm_year = year - 1900;
+  tm.tm_mon = month - 1;
+  tm.tm_mday = day;
+  tm.tm_isdst = -1;
+  return mktime(&tm);
+}
+
+class Device {
+ public:
+  Device() {
+    setenv("TZ", "Europe/Berlin", 1);
+    tzset();
+    setenv("DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/nonexistent/bus", 1);
+    char tmpl[] = "/tmp/logmgr-bench-XXXXXX";
+    sysroot = mkdtemp(tmpl);
+    (void)system(("mkdir -p " + sysroot + "/opt/usr/dbspace").c_str());
+    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
+    (void)ProviderRegistry::GetInstance()->CreateProviders();
+    (void)DbManager::GetInstance()->Init();
+    (void)UploadDbManager::GetInstance()->Init();
+    (void)prefs.Create();
+    survey = DbManager::GetInstance()->GetConnection();
+    upload = UploadDbManager::GetInstance()->GetConnection();
+    SetRuntimeSwitch(1, true);
+    day = LocalMidnight(2024, 6, 11);
+    g_nowMs = (static_cast<int64_t>(day) + 34 * 3600) * 1000;  // next day, 10:00
+  }
+  ~Device() {
+    (void)prefs.Close();
+    ProviderRegistry::Release();
+    DbManager::CloseInstance();
+    UploadDbManager::CloseInstance();
+    (void)system(("rm -rf " + sysroot).c_str());
+  }
+
+  // 5000 rows in each aggregated table, evenly over the day, 40 apps and 10 features.
+  void SeedDay() {
+    (void)survey->Exec("BEGIN;");
+    char sql[256];
+    for (int i = 0; i < kRowsPerTable; ++i) {
+      long long stamp = (static_cast<long long>(day) * 1000) + i * (86400000LL / kRowsPerTable);
+      snprintf(sql, sizeof(sql),
+               "INSERT INTO use_app_survey(timestamp,app_id,duration) VALUES (%lld,'app.%d',%d);",
+               stamp, i % 40, i);
+      (void)survey->Exec(sql);
+      snprintf(sql, sizeof(sql),
+               "INSERT INTO manage_app_survey(timestamp,installed_app_id,type) "
+               "VALUES (%lld,'app.%d',%d);", stamp, i % 40, i % 3);
+      (void)survey->Exec(sql);
+      snprintf(sql, sizeof(sql),
+               "INSERT INTO report_app_error_survey(timestamp,app_id,type) "
+               "VALUES (%lld,'app.%d',%d);", stamp, i % 40, i % 2);
+      (void)survey->Exec(sql);
+      snprintf(sql, sizeof(sql),
+               "INSERT INTO use_app_feature_survey(timestamp,app_id,feature,extra,value) "
+               "VALUES (%lld,'lm','F%03d','',%d);", stamp, i % 10, i);
+      (void)survey->Exec(sql);
+    }
+    (void)survey->Exec("COMMIT;");
+    (void)prefs.SetSentDate(static_cast<int32_t>(day - 86400));
+    (void)upload->Exec("DELETE FROM survey_log;");
+  }
+
+  std::string sysroot;
+  PrefStore prefs;
+  DbConnection* survey = nullptr;
+  DbConnection* upload = nullptr;
+  time_t day = 0;
+};
+
+void BM_DailyRunAtTableLimits(benchmark::State& state) {
+  Device device;
+  for (auto _ : state) {
+    state.PauseTiming();
+    device.SeedDay();
+    ReportBuilder builder;
+    builder.SetPrefStore(&device.prefs);
+    builder.SetClock(&BenchClock);
+    state.ResumeTiming();
+    if (builder.RunDaily() != 0) state.SkipWithError("daily run failed");
+  }
+}
+BENCHMARK(BM_DailyRunAtTableLimits)->Unit(benchmark::kMillisecond);
+
+// The same selects straight on SQLite: no records written, nothing purged.
+void BM_BareGroupByQueries(benchmark::State& state) {
+  Device device;
+  device.SeedDay();
+  long long dayMs = static_cast<long long>(device.day) * 1000;
+  struct Query {
+    const char* sql;
+    int windows;
+    long long length;
+  } queries[] = {
+      {"SELECT timestamp,app_id,duration , COUNT(1), SUM(duration) FROM use_app_survey "
+       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id;", 8, 3 * 3600000LL},
+      {"SELECT timestamp,installed_app_id,type FROM manage_app_survey "
+       "WHERE timestamp >= ?1 and timestamp < ?2;", 1, 86399000LL},
+      {"SELECT timestamp,app_id,type , COUNT(1) FROM report_app_error_survey "
+       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id,type;", 1, 86400000LL},
+      {"SELECT timestamp,app_id,feature,extra,value , COUNT(1), SUM(value) FROM "
+       "use_app_feature_survey WHERE timestamp >= ?1 and timestamp < ?2 "
+       "GROUP BY app_id,feature,extra;", 8, 3 * 3600000LL},
+  };
+  long long cells = 0;
+  for (auto _ : state) {
+    for (const Query& q : queries) {
+      for (int w = 0; w < q.windows; ++w) {
+        sqlite3_stmt* stmt = nullptr;
+        (void)sqlite3_prepare_v2(device.survey->Handle(), q.sql, -1, &stmt, nullptr);
+        sqlite3_bind_int64(stmt, 1, dayMs + w * q.length);
+        sqlite3_bind_int64(stmt, 2, dayMs + (w + 1) * q.length);
+        while (sqlite3_step(stmt) == SQLITE_ROW) {
+          for (int c = 0; c < sqlite3_column_count(stmt); ++c) {
+            cells += sqlite3_column_bytes(stmt, c) + (sqlite3_column_text(stmt, c) != nullptr);
+          }
+        }
+        sqlite3_finalize(stmt);
+      }
+    }
+  }
+  benchmark::DoNotOptimize(cells);
+}
+BENCHMARK(BM_BareGroupByQueries)->Unit(benchmark::kMillisecond);
+
+void BM_SendThousandRecords(benchmark::State& state) {
+  Device device;
+  ReportBuilder builder;
+  Uploader uploader;
+  uploader.SetClock(&BenchClock);
+  uploader.SetAppId("com.corvane.logmanager");
+  (void)uploader.Init(&builder);
+  std::string outbox = device.sysroot + "/opt/usr/data/log-relay/outbox.jsonl";
+  for (auto _ : state) {
+    state.PauseTiming();
+    (void)unlink(outbox.c_str());
+    (void)device.upload->Exec("BEGIN;");
+    char sql[512];
+    for (int i = 0; i < 1000; ++i) {
+      snprintf(sql, sizeof(sql),
+               "INSERT INTO survey_log(timestamp,svc_code,category_code,activity,log_type,"
+               "app_version,body) VALUES (%lld,'701','999','00%d','BIZ','W2','mcc=¶mnc=¶did=¶"
+               "model=m¶fw_ver=W2¶date=2024-06-11T03:00:00+0200¶sum=3¶count=%d¶app_id=app.%d¶"
+               "duration=%d');",
+               static_cast<long long>(g_nowMs - 1000), 1 + i % 4, i, i % 40, i * 7);
+      (void)device.upload->Exec(sql);
+    }
+    (void)device.upload->Exec("COMMIT;");
+    state.ResumeTiming();
+    uploader.SendAll();
+  }
+  state.SetItemsProcessed(state.iterations() * 1000);
+}
+BENCHMARK(BM_SendThousandRecords)->Unit(benchmark::kMillisecond);
+
+}  // namespace
+}  // namespace _CorvaneLogManager
+
+#endif  // storage/db_connection.cc
+
+BENCHMARK_MAIN();

@@ -1,0 +1,308 @@
+#include "reporting/report_builder.h"
+
+#include <stdarg.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/time.h>
+
+#include "base_log_provider.h"
+#include "log_manager.h"
+#include "provider_registry.h"
+#include "reporting/row_splitter.h"
+#include "storage/pref_store.h"
+
+namespace _CorvaneLogManager {
+
+// How one collection table becomes records. Columns after timestamp give the pair keys; a
+// grouped table adds COUNT (and in slice mode maybe SUM, which replaces the last column).
+struct Aggregation {
+  const char* table;
+  const char* activity;
+  const char* columns;
+  const char* keys[5];  // pair keys of the columns after timestamp, null-terminated
+  bool grouped;         // false: one record per row, no sum/count pairs, always mode 0
+  const char* sliceAggregate;
+  const char* sliceGroup;
+  const char* sliceSum;
+  int sliceWindows;
+  int sliceHours;
+  bool sliceSumsLast;
+  const char* plainAggregate;
+  const char* plainGroup;
+  const char* plainSum;
+};
+
+namespace {
+
+constexpr char kDateFormat[] = "%Y-%m-%dT%H:%M:%S%z";
+constexpr char kSeparator[] = "\xC2\xB6";  // "¶"
+constexpr char kRecordColumns[] = "svc_code,category_code,activity,log_type,app_version,body";
+constexpr char kDefaultVersion[] = "99.02.00";
+constexpr size_t kValuesSize = 800;  // keeps the queue's 1024-byte insert statement whole
+constexpr int kTallyExtra = 30;
+
+// In the order the day is processed.
+const Aggregation kAggregations[] = {
+    {"use_app_survey", "001", "timestamp,app_id,duration", {"app_id", "duration", nullptr}, true,
+     " , COUNT(1), SUM(duration)", "app_id", "3", 8, 3, true, " , COUNT(1)", "timestamp", "0"},
+    {"manage_app_survey", "003", "timestamp,installed_app_id,type", {"app_id", "type", nullptr},
+     false, "", nullptr, "", 0, 0, false, "", nullptr, ""},
+    {"report_app_error_survey", "004", "timestamp,app_id,type", {"app_id", "type", nullptr}, true,
+     " , COUNT(1)", "app_id,type", "24", 1, 24, false, " , COUNT(1)", "timestamp", "0"},
+    {"use_app_feature_survey", "002", "timestamp,app_id,feature,extra,value",
+     {"app_id", "feature", "extra", "value", nullptr}, true, " , COUNT(1), SUM(value)",
+     "app_id,feature,extra", "3", 8, 3, true, " , COUNT(1)", "timestamp", "0"},
+};
+
+bool g_sliceMode = true;
+
+time_t MidnightDaysAgo(time_t now, int days) {
+  struct tm tm;
+  if (localtime_r(&now, &tm) == nullptr) return 0;
+  tm.tm_hour = 0;
+  tm.tm_min = 0;
+  tm.tm_sec = 0;
+  tm.tm_mday -= days;
+  tm.tm_isdst = -1;
+  return mktime(&tm);
+}
+
+// 0 when the time cannot be rendered.
+size_t RenderDate(time_t seconds, char* out, size_t size) {
+  struct tm tm;
+  if (localtime_r(&seconds, &tm) == nullptr) return 0;
+  return strftime(out, size, kDateFormat, &tm);
+}
+
+// Device texts go into records unchanged except for ",", which would split the queue row.
+std::string DeviceText(const char* text) {
+  std::string out = text != nullptr ? text : "";
+  for (char& c : out) {
+    if (c == ',') c = ';';
+  }
+  return out;
+}
+
+// Appends |text| to the NUL-terminated |out| of |size| bytes with every "'" doubled, stopping
+// before a character that would not fit whole. Returns the bytes of |text| taken.
+size_t AppendQuoted(char* out, size_t size, const char* text) {
+  size_t used = strlen(out);
+  size_t taken = 0;
+  for (; text[taken] != '\0'; ++taken) {
+    size_t need = text[taken] == '\'' ? 2 : 1;
+    if (used + need >= size) break;
+    out[used++] = text[taken];
+    if (need == 2) out[used++] = '\'';
+  }
+  out[used] = '\0';
+  return taken;
+}
+
+// Formats at the end of |buf|; a text that does not fit is cut, |*len| stays below |size|.
+__attribute__((format(printf, 4, 5))) void AppendF(char* buf, size_t size, size_t* len,
+                                                   const char* format, ...) {
+  if (*len + 1 >= size) return;
+  va_list args;
+  va_start(args, format);
+  int n = vsnprintf(buf + *len, size - *len, format, args);
+  va_end(args);
+  if (n > 0) *len = (*len + n < size) ? *len + n : size - 1;
+}
+
+void FreeRows(char** rows, int rowCount) {
+  if (rows == nullptr) return;
+  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
+  delete[] rows;
+}
+
+}  // namespace
+
+int64_t SystemClockMs() {
+  struct timeval tv;
+  gettimeofday(&tv, nullptr);
+  return static_cast<int64_t>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
+}
+
+void ReportBuilder::SetSliceMode(bool on) { g_sliceMode = on; }
+bool ReportBuilder::SliceMode() { return g_sliceMode; }
+
+PrefStore* ReportBuilder::Prefs() const {
+  if (prefStore != nullptr) return prefStore;
+  LogManager* manager = LogManager::GetInstance();
+  return manager != nullptr ? manager->GetPrefStore() : nullptr;
+}
+
+const char* ReportBuilder::AppVersion() const {
+  return identity.Firmware() != nullptr ? identity.Firmware() : kDefaultVersion;
+}
+
+int ReportBuilder::RunDaily() {
+  if (!GetRuntimeSwitch(1)) return -1;
+  (void)identity.Refresh();
+  PrefStore* prefs = Prefs();
+  if (prefs == nullptr) return -1;
+  time_t now = static_cast<time_t>((clockFn != nullptr ? clockFn() : SystemClockMs()) / 1000);
+  time_t limit = MidnightDaysAgo(now, 1);
+  time_t day = static_cast<time_t>(prefs->NormaliseSentDate());
+  if (day == 0) return -1;
+
+  while (day < limit) {
+    struct tm tm;
+    if (localtime_r(&day, &tm) == nullptr) return -1;
+    tm.tm_mday += 1;
+    tm.tm_isdst = -1;
+    day = mktime(&tm);
+    char dayText[kDateSize] = "";
+    (void)RenderDate(day, dayText, sizeof(dayText));
+
+    sizeTally.clear();
+    for (const char* activity : {"001", "002", "003", "004"}) sizeTally[activity] = 0;
+    for (const Aggregation& spec : kAggregations) {
+      if (Aggregate(spec, day) != 0) return -1;
+    }
+    if (WriteSummary(dayText) != 0) return -1;
+    (void)prefs->SetSentDate(static_cast<int32_t>(day));
+  }
+  return 0;
+}
+
+void ReportBuilder::ComputeWindow(time_t day, int mode, int offsetHours, int lengthHours) {
+  struct tm tm;
+  long long start = 0;
+  long long end = 0;
+  if (localtime_r(&day, &tm) != nullptr) {
+    tm.tm_isdst = -1;
+    if (mode == 0) {
+      start = static_cast<long long>(day) * 1000;
+      tm.tm_hour += 23;
+      tm.tm_min += 59;
+      tm.tm_sec += 59;
+      end = static_cast<long long>(mktime(&tm)) * 1000;
+    } else {
+      tm.tm_hour += offsetHours;
+      start = static_cast<long long>(mktime(&tm)) * 1000;
+      tm.tm_hour += lengthHours;
+      tm.tm_isdst = -1;
+      end = static_cast<long long>(mktime(&tm)) * 1000;
+    }
+  }
+  snprintf(windowStart, sizeof(windowStart), "%lld", start);
+  snprintf(windowEnd, sizeof(windowEnd), "%lld", end);
+}
+
+int ReportBuilder::Aggregate(const Aggregation& spec, time_t day) {
+  bool slice = g_sliceMode && spec.sliceWindows > 0;
+  char columns[200];
+  snprintf(columns, sizeof(columns), "%s%s", spec.columns,
+           slice ? spec.sliceAggregate : spec.plainAggregate);
+  const char* group = slice ? spec.sliceGroup : spec.plainGroup;
+  const char* sumText = slice ? spec.sliceSum : spec.plainSum;
+  int windows = slice ? spec.sliceWindows : 1;
+
+  for (int w = 0; w < windows; ++w) {
+    if (slice) {
+      ComputeWindow(day, 2, w * spec.sliceHours, spec.sliceHours);
+    } else {
+      ComputeWindow(day, 0, 0, 0);
+    }
+    char where[256];
+    snprintf(where, sizeof(where), "timestamp >= %s and timestamp < %s", windowStart, windowEnd);
+    BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(spec.table);
+    if (provider == nullptr) return -1;
+    int rowCount = 0;
+    char** rows = nullptr;
+    int selected = spec.grouped
+                       ? provider->SelectGroupedRows(columns, where, nullptr, group, &rowCount, &rows)
+                       : provider->SelectRows(columns, where, nullptr, &rowCount, &rows);
+    if (selected != 0) {
+      FreeRows(rows, rowCount);
+      return -1;
+    }
+    int result = 0;
+    for (int i = 0; i < rowCount && result == 0 && rows != nullptr; ++i) {
+      result = WriteRow(spec, slice, sumText, rows[i]);
+    }
+    FreeRows(rows, rowCount);
+    if (result != 0) return -1;
+  }
+  return PurgeTable(spec.table, windowEnd);
+}
+
+int ReportBuilder::WriteRow(const Aggregation& spec, bool slice, const char* sumText,
+                            char* rowText) {
+  int keyCount = 0;
+  while (spec.keys[keyCount] != nullptr) ++keyCount;
+  bool hasSum = slice && spec.sliceSumsLast;
+  int fieldCount = 1 + keyCount + (spec.grouped ? 1 : 0) + (hasSum ? 1 : 0);
+  char** fields = RowSplitter::SplitRows(&rowText, 1, fieldCount);
+  if (fields == nullptr) return -1;
+
+  // An aggregated group has no single time of its own: slice records carry the window end.
+  long long stamp = slice ? strtoll(windowEnd, nullptr, 10) : strtoll(fields[0], nullptr, 10);
+  char date[kDateSize];
+  if (RenderDate(static_cast<time_t>(stamp / 1000), date, sizeof(date)) == 0) {
+    delete[] fields;
+    return 0;  // skipped silently
+  }
+
+  char body[kBodySize];
+  size_t len = BeginBody(body, sizeof(body), date);
+  if (spec.grouped) {
+    AppendF(body, sizeof(body), &len, "sum=%s%scount=%s", sumText, kSeparator,
+            fields[1 + keyCount]);
+  }
+  for (int k = 0; k < keyCount; ++k) {
+    const char* value = (hasSum && k == keyCount - 1) ? fields[fieldCount - 1] : fields[1 + k];
+    bool first = !spec.grouped && k == 0;
+    AppendF(body, sizeof(body), &len, "%s%s=%s", first ? "" : kSeparator, spec.keys[k], value);
+  }
+  delete[] fields;
+  return WriteRecord(spec.activity, body);
+}
+
+size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) const {
+  size_t len = 0;
+  body[0] = '\0';
+  AppendF(body, size, &len, "mcc=%s%smnc=%s%sdid=%smodel=%s%sfw_ver=%s%sdate=%s%s",
+          DeviceText(identity.Mcc()).c_str(), kSeparator, DeviceText(identity.Mnc()).c_str(),
+          kSeparator, kSeparator, DeviceText(identity.Model()).c_str(), kSeparator,
+          DeviceText(AppVersion()).c_str(), kSeparator, date, kSeparator);
+  return len;
+}
+
+int ReportBuilder::WriteSummary(const char* renderedDay) {
+  char body[kBodySize];
+  size_t len = BeginBody(body, sizeof(body), renderedDay);
+  AppendF(body, sizeof(body), &len, "size_001=%d%ssize_002=%d%ssize_003=%d%ssize_004=%d",
+           sizeTally["001"], kSeparator, sizeTally["002"], kSeparator, sizeTally["003"],
+           kSeparator, sizeTally["004"]);
+  return WriteRecord("007", body);
+}
+
+int ReportBuilder::WriteRecord(const char* activity, const char* body) {
+  char values[kValuesSize];
+  snprintf(values, sizeof(values), "'701','999','%s','BIZ','", activity);
+  (void)AppendQuoted(values, sizeof(values), DeviceText(AppVersion()).c_str());
+  size_t used = strlen(values);
+  snprintf(values + used, sizeof(values) - used, "','");
+  // One byte kept back for the closing quote.
+  size_t stored = AppendQuoted(values, sizeof(values) - 1, body);
+  used = strlen(values);
+  snprintf(values + used, sizeof(values) - used, "'");
+  sizeTally[activity] += static_cast<int32_t>(stored) + kTallyExtra;
+
+  BaseLogProvider* queue = ProviderRegistry::GetInstance()->Lookup("server_upload");
+  if (queue == nullptr) return -1;
+  return queue->InsertRow(kRecordColumns, values);
+}
+
+int ReportBuilder::PurgeTable(const char* table, const char* bound) {
+  BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(table);
+  if (provider == nullptr) return -1;
+  char where[256];
+  snprintf(where, sizeof(where), "timestamp < %s", bound);
+  return provider->DeleteRows(where) == 0 ? 0 : -1;
+}
+
+}  // namespace _CorvaneLogManager

@@ -1,0 +1,85 @@
+// ReportBuilder: turns each complete local day of the collection tables into upload records of
+// the survey_log queue, with one size summary per day, then advances key_sent_date.
+//
+// Texts from outside callers: every record field comes from a row text split at ",", so a ","
+// inside a collection value splits that value and shifts the later fields of that one record
+// (its surplus tail is dropped); no queued text ever holds a ",", which keeps the uploader's
+// split of the queue row aligned. A "'" is carried verbatim (doubled inside the insert
+// statement), so it can neither break the day's inserts nor leak into another record. Device
+// texts (model, firmware) have any "," replaced by ";". A body longer than the record buffer is
+// cut, never overflowing the insert statement.
+#ifndef LOGMGR_REPORTING_REPORT_BUILDER_H_
+#define LOGMGR_REPORTING_REPORT_BUILDER_H_
+
+#include <stdint.h>
+#include <time.h>
+
+#include <map>
+#include <string>
+
+#include "reporting/device_identity.h"
+
+namespace _CorvaneLogManager {
+
+class PrefStore;
+struct Aggregation;
+
+// Milliseconds since the epoch; injectable so day boundaries can be tested.
+typedef int64_t (*ReportClock)();
+int64_t SystemClockMs();
+
+class ReportBuilder {
+ public:
+  static constexpr size_t kBodySize = 640;
+  static constexpr size_t kDateSize = 80;
+
+  ReportBuilder() = default;
+  ~ReportBuilder() = default;
+
+  // Aggregates every day after key_sent_date up to yesterday, oldest first, advancing the
+  // sent date after each. 0 when all due days were done; -1 otherwise (the failed day is
+  // repeated by the next run; its records already queued stay, so it may queue them twice).
+  int RunDaily();
+
+  // Window of day start |day| (local midnight, seconds): mode 0 is the whole day up to
+  // 23:59:59 (the last second deliberately outside); mode 2 is |lengthHours| from
+  // |offsetHours|. Sets the window texts (ms).
+  void ComputeWindow(time_t day, int mode, int offsetHours, int lengthHours);
+  const char* WindowStart() const { return windowStart; }
+  const char* WindowEnd() const { return windowEnd; }
+
+  // Deletes rows of the provider |table| with timestamp < |bound|. 0 / -1.
+  int PurgeTable(const char* table, const char* bound);
+  // Queues one record of |activity| and counts its size in the day's tally. The insert's result.
+  int WriteRecord(const char* activity, const char* body);
+
+  // Slice mode (on as shipped): the usage tables in eight 3-hour windows with COUNT and SUM.
+  static void SetSliceMode(bool on);
+  static bool SliceMode();
+
+  // Defaults: LogManager's store and the system clock.
+  void SetPrefStore(PrefStore* store) { prefStore = store; }
+  void SetClock(ReportClock clock) { clockFn = clock; }
+  const DeviceIdentity& Identity() const { return identity; }
+  // "99.02.00" until the firmware is known.
+  const char* AppVersion() const;
+
+ private:
+  PrefStore* Prefs() const;
+  int Aggregate(const Aggregation& spec, time_t day);
+  int WriteRow(const Aggregation& spec, bool slice, const char* sumText, char* rowText);
+  int WriteSummary(const char* renderedDay);
+  // Header pairs and the date pair, each followed by the separator.
+  size_t BeginBody(char* body, size_t size, const char* date) const;
+
+  char windowStart[24] = "";
+  char windowEnd[24] = "";
+  std::map<std::string, int32_t> sizeTally;
+  DeviceIdentity identity;
+  PrefStore* prefStore = nullptr;
+  ReportClock clockFn = nullptr;
+};
+
+}  // namespace _CorvaneLogManager
+
+#endif  // LOGMGR_REPORTING_REPORT_BUILDER_H_

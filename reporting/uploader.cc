@@ -1,0 +1,164 @@
+#include "reporting/uploader.h"
+
+#include <corvane_log_relay.h>
+#include <stdio.h>
+#include <time.h>
+
+#include <new>
+
+#include "log_manager.h"
+#include "providers/server_upload_log_provider.h"
+#include "reporting/row_splitter.h"
+
+namespace _CorvaneLogManager {
+
+namespace {
+
+constexpr char kQueueColumns[] =
+    "_id,timestamp,svc_code,category_code,activity,log_type,app_version, body, rly_result";
+
+// Hand-over order: the daily summary first, the feature records last.
+struct Rank {
+  const char* activity;
+  const char* then;
+};
+const Rank kRanks[] = {{"007", "' THEN 0 "},
+                       {"001", "' THEN 1 "},
+                       {"003", "' THEN 2 "},
+                       {"004", "' THEN 3 "},
+                       {"002", "' THEN 4 "}};
+
+enum Field { kId, kTimestamp, kSvcCode, kCategory, kActivity, kLogType, kAppVersion, kBody };
+
+void FreeRows(char** rows, int rowCount) {
+  if (rows == nullptr) return;
+  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
+  delete[] rows;
+}
+
+}  // namespace
+
+Uploader::~Uploader() { delete queue; }
+
+int Uploader::Init(ReportBuilder* reportBuilder) {
+  if (reportBuilder == nullptr) return -1;
+  builder = reportBuilder;
+  queue = new (std::nothrow) ServerUploadLogProvider();
+  return queue == nullptr ? -1 : 0;
+}
+
+char** Uploader::SplitRows(char** rows, int rowCount) {
+  return RowSplitter::SplitRows(rows, rowCount, kRecordFields);
+}
+
+std::string Uploader::RankOrder() {
+  std::string text = "CASE activity ";
+  for (const Rank& rank : kRanks) {
+    text += "WHEN '";
+    text += rank.activity;
+    text += rank.then;
+  }
+  return text + "END ";
+}
+
+int64_t Uploader::NowMs() const { return clockFn != nullptr ? clockFn() : SystemClockMs(); }
+
+void Uploader::SendAll() {
+  if (builder == nullptr || queue == nullptr || !GetRuntimeSwitch(1)) return;
+  PurgeOutOfWindow();
+  SendBatch(kBatchLimit);
+  DeleteSent();
+}
+
+void Uploader::PurgeOutOfWindow() {
+  int64_t now = NowMs();
+  time_t seconds = static_cast<time_t>(now / 1000);
+  struct tm tm;
+  if (localtime_r(&seconds, &tm) == nullptr) return;
+  tm.tm_hour = 0;
+  tm.tm_min = 0;
+  tm.tm_sec = 0;
+  tm.tm_mday -= 3;
+  tm.tm_isdst = -1;
+  long long lower = static_cast<long long>(mktime(&tm)) * 1000;
+  char where[100];
+  snprintf(where, sizeof(where), " timestamp < %lld or timestamp > %lld", lower,
+           static_cast<long long>(now));
+  (void)queue->DeleteRows(where);
+}
+
+void Uploader::SendBatch(uint32_t limit) {
+  int rowCount = 0;
+  char** rows = nullptr;
+  std::string order = RankOrder();
+  if (queue->SelectLimitedRows(kQueueColumns, nullptr, order.c_str(), limit, &rowCount, &rows) !=
+          0 ||
+      rows == nullptr) {
+    FreeRows(rows, rowCount);
+    return;
+  }
+  char** fields = SplitRows(rows, rowCount);
+  if (fields == nullptr) {
+    FreeRows(rows, rowCount);
+    return;
+  }
+  if (appId.empty()) {
+    LogManager* manager = LogManager::GetInstance();
+    if (manager != nullptr) appId = manager->GetName();
+  }
+
+  for (int i = 0; i < rowCount; ++i) {
+    char** record = fields + static_cast<size_t>(i) * kRecordFields;
+    int64_t nowMs = NowMs();
+    time_t seconds = static_cast<time_t>(nowMs / 1000);
+
+    corvane_log_item_h handle = nullptr;
+    if (corvane_log_relay_mobile_create_log_item_handle(&handle) != 0 && handle == nullptr) break;
+    const struct {
+      int item;
+      const void* value;
+    } items[] = {{CORVANE_LOG_ITEM_APP_ID, appId.c_str()},
+                 {CORVANE_LOG_ITEM_LOG_TYPE, record[kLogType]},
+                 {CORVANE_LOG_ITEM_SVC_CODE, record[kSvcCode]},
+                 {CORVANE_LOG_ITEM_TIME, &nowMs},
+                 {CORVANE_LOG_ITEM_ACTIVITY, record[kActivity]},
+                 {CORVANE_LOG_ITEM_APP_VERSION, record[kAppVersion]},
+                 {CORVANE_LOG_ITEM_BODY, record[kBody]}};
+    bool setFailed = false;
+    for (const auto& entry : items) {
+      if (corvane_log_relay_mobile_set_log_item(handle, entry.item, entry.value) != 0) {
+        setFailed = true;
+        break;
+      }
+    }
+    // Deliberately not freed after a failed set: kept as it stands.
+    if (setFailed) break;
+    if (corvane_log_relay_mobile_register_log_item(handle) != 0) {
+      (void)corvane_log_relay_mobile_free_log_item(handle);
+      break;
+    }
+    (void)corvane_log_relay_mobile_free_log_item(handle);
+    handle = nullptr;
+
+    char where[100];
+    snprintf(where, sizeof(where), "_id = %s", record[kId]);
+    if (queue->UpdateRows("rly_result", "success", where) != 0) break;
+
+    // Rendered as the hand-over log line would be; nothing is logged.
+    char stamp[100];
+    struct tm tm;
+    if (localtime_r(&seconds, &tm) != nullptr) {
+      (void)strftime(stamp, sizeof(stamp), "%d/%b/%Y:%H:%M:%S", &tm);
+    }
+  }
+  delete[] fields;
+  FreeRows(rows, rowCount);
+}
+
+void Uploader::DeleteSent() {
+  char where[100];
+  snprintf(where, sizeof(where), "rly_result = '%s'", "success");
+  (void)queue->DeleteRows(where);
+}
+
+}  // namespace _CorvaneLogManager

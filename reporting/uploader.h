@@ -1,0 +1,59 @@
+// Uploader: empties the survey_log queue into the log-relay library, highest rank first, at
+// most 1000 records per send; drops records stamped before midnight three days ago or in the
+// future. A record leaves the queue only once the relay has taken it and it was marked.
+#ifndef LOGMGR_REPORTING_UPLOADER_H_
+#define LOGMGR_REPORTING_UPLOADER_H_
+
+#include <stdint.h>
+
+#include <string>
+
+#include "reporting/report_builder.h"
+
+namespace _CorvaneLogManager {
+
+class ServerUploadLogProvider;
+
+class Uploader {
+ public:
+  static constexpr uint32_t kBatchLimit = 1000;
+  // Fields of a queued record as read back: _id, timestamp, svc_code, category_code,
+  // activity, log_type, app_version, body, rly_result.
+  static constexpr int kRecordFields = 9;
+
+  Uploader() = default;
+  ~Uploader();
+  Uploader(const Uploader&) = delete;
+  Uploader& operator=(const Uploader&) = delete;
+
+  // Takes the report pair's builder (-1 when null) and makes the own queue provider
+  // (-1 when that allocation fails). 0 on success.
+  int Init(ReportBuilder* reportBuilder);
+  // Purge out-of-window records, hand over one batch, delete what was handed over. Runs only
+  // with a builder and runtime switch 1 on.
+  void SendAll();
+
+  // The row splitter: nine field pointers per row, cut in place; null when allocation fails.
+  static char** SplitRows(char** rows, int rowCount);
+  // "CASE activity WHEN '007' THEN 0 ... END " (ends in a blank: LIMIT follows directly).
+  static std::string RankOrder();
+
+  // Defaults: the system clock and LogManager's application id.
+  void SetClock(ReportClock clock) { clockFn = clock; }
+  void SetAppId(const char* id) { appId = id != nullptr ? id : ""; }
+
+ private:
+  int64_t NowMs() const;
+  void PurgeOutOfWindow();
+  void SendBatch(uint32_t limit);
+  void DeleteSent();
+
+  ServerUploadLogProvider* queue = nullptr;
+  ReportBuilder* builder = nullptr;
+  ReportClock clockFn = nullptr;
+  std::string appId;
+};
+
+}  // namespace _CorvaneLogManager
+
+#endif  // LOGMGR_REPORTING_UPLOADER_H_

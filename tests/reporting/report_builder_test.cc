@@ -1,0 +1,200 @@
+#include "reporting/report_builder.h"
+
+#include "reporting_test_env.h"
+
+// Needs the real database connection; built once the storage layer provides it.
+#if __has_include("storage/db_connection.cc")
+
+namespace _CorvaneLogManager {
+namespace {
+
+// Header of every record: no SIM on the test bus, model and build from the sysroot's files.
+const std::string kHead = "mcc=¶mnc=¶did=¶model=Gear-X1¶fw_ver=W2.3-K9¶";
+
+class ReportBuilderTest : public ReportingTest {
+ protected:
+  void SetUp() override {
+    ReportingTest::SetUp();
+    builder.SetPrefStore(&prefs);
+    builder.SetClock(&TestClock);
+  }
+
+  void Now(int year, int month, int day, int hour) {
+    g_testNowMs = LocalMs(year, month, day, hour);
+  }
+  void SentDate(int year, int month, int day) {
+    ASSERT_EQ(prefs.SetSentDate(static_cast<int32_t>(LocalMs(year, month, day) / 1000)), 0);
+  }
+  void Row(const std::string& table, const std::string& columns, int64_t stamp,
+           const std::string& values) {
+    Exec(survey, "INSERT INTO " + table + "(timestamp," + columns + ") VALUES (" +
+                     std::to_string(stamp) + "," + values + ");");
+  }
+  std::vector<std::string> Bodies(const std::string& activity) {
+    return Column(upload, "SELECT body FROM survey_log WHERE activity='" + activity +
+                              "' ORDER BY _id");
+  }
+
+  ReportBuilder builder;
+};
+
+TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
+  Now(2024, 6, 12, 10);
+  SentDate(2024, 6, 10);
+  const std::string useApp = "use_app_survey", feature = "use_app_feature_survey";
+  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 1), "'a.calc',1000");
+  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 2, 30), "'a.calc',500");
+  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 2), "'b.mail',200");
+  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 22), "'a.calc',300");
+  Row(useApp, "app_id,duration", LocalMs(2024, 6, 10, 22), "'old.day',1");   // purged unsent
+  Row(useApp, "app_id,duration", LocalMs(2024, 6, 12, 0, 0, 0, 1), "'today',1");  // kept
+  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 11, 10, 15, 30),
+      "'c.game',1");
+  Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 8), "'a.calc',2");
+  Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 9), "'a.calc',2");
+  Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 12), "'b.mail',1");
+  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 13), "'lm','SCRN','',4000");
+  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 14, 59, 59), "'lm','SCRN','',1000");
+  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 15), "'lm','WIFI','',10");
+
+  ASSERT_EQ(builder.RunDaily(), 0);
+
+  const std::vector<std::string> use = {
+      kHead + "date=2024-06-11T03:00:00+0200¶sum=3¶count=2¶app_id=a.calc¶duration=1500",
+      kHead + "date=2024-06-11T03:00:00+0200¶sum=3¶count=1¶app_id=b.mail¶duration=200",
+      kHead + "date=2024-06-12T00:00:00+0200¶sum=3¶count=1¶app_id=a.calc¶duration=300"};
+  const std::vector<std::string> manage = {kHead +
+                                           "date=2024-06-11T10:15:30+0200¶app_id=c.game¶type=1"};
+  const std::vector<std::string> errors = {
+      kHead + "date=2024-06-12T00:00:00+0200¶sum=24¶count=2¶app_id=a.calc¶type=2",
+      kHead + "date=2024-06-12T00:00:00+0200¶sum=24¶count=1¶app_id=b.mail¶type=1"};
+  const std::vector<std::string> features = {
+      kHead + "date=2024-06-11T15:00:00+0200¶sum=3¶count=2¶app_id=lm¶feature=SCRN¶extra=¶value=5000",
+      kHead + "date=2024-06-11T18:00:00+0200¶sum=3¶count=1¶app_id=lm¶feature=WIFI¶extra=¶value=10"};
+  EXPECT_EQ(Bodies("001"), use);
+  EXPECT_EQ(Bodies("003"), manage);
+  EXPECT_EQ(Bodies("004"), errors);
+  EXPECT_EQ(Bodies("002"), features);
+
+  auto tally = [](const std::vector<std::string>& bodies) {
+    size_t size = 0;
+    for (const std::string& body : bodies) size += body.size() + 30;
+    return std::to_string(size);
+  };
+  EXPECT_EQ(Bodies("007"), std::vector<std::string>{kHead + "date=2024-06-11T00:00:00+0200¶size_001=" +
+                                                    tally(use) + "¶size_002=" + tally(features) +
+                                                    "¶size_003=" + tally(manage) + "¶size_004=" +
+                                                    tally(errors)});
+  // Insertion order is the day's processing order; the fixed columns of every record.
+  EXPECT_EQ(Column(upload, "SELECT group_concat(activity, ' ') FROM survey_log"),
+            std::vector<std::string>{"001 001 001 003 004 004 002 002 007"});
+  EXPECT_EQ(Column(upload, "SELECT DISTINCT svc_code||category_code||log_type||app_version "
+                           "FROM survey_log"),
+            std::vector<std::string>{"701999BIZW2.3-K9"});
+
+  // The day and everything before it is gone; today's row waits.
+  for (const char* table : {"use_app_survey", "manage_app_survey", "report_app_error_survey",
+                            "use_app_feature_survey"}) {
+    SCOPED_TRACE(table);
+    EXPECT_EQ(Column(survey, std::string("SELECT count(*) FROM ") + table),
+              std::vector<std::string>{table == useApp ? "1" : "0"});
+  }
+  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
+
+  // Nothing is due any more: a second run writes nothing.
+  ASSERT_EQ(builder.RunDaily(), 0);
+  EXPECT_EQ(Column(upload, "SELECT count(*) FROM survey_log"), std::vector<std::string>{"9"});
+}
+
+TEST_F(ReportBuilderTest, ThreeDaysBackAreProcessedOldestFirst) {
+  Now(2024, 6, 12, 10);
+  SentDate(2024, 6, 8);
+  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 10, 12), "'m.two',0");
+  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 9, 12), "'m.one',0");
+
+  ASSERT_EQ(builder.RunDaily(), 0);
+
+  std::vector<std::string> summaryDates;
+  for (const std::string& body : Bodies("007")) summaryDates.push_back(body.substr(kHead.size(), 29));
+  EXPECT_EQ(summaryDates, (std::vector<std::string>{"date=2024-06-09T00:00:00+0200",
+                                                    "date=2024-06-10T00:00:00+0200",
+                                                    "date=2024-06-11T00:00:00+0200"}));
+  EXPECT_EQ(Bodies("003"),
+            (std::vector<std::string>{kHead + "date=2024-06-09T12:00:00+0200¶app_id=m.one¶type=0",
+                                      kHead + "date=2024-06-10T12:00:00+0200¶app_id=m.two¶type=0"}));
+  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
+}
+
+TEST_F(ReportBuilderTest, ManageRowInTheLastSecondIsDroppedUnreportedByTheNextDay) {
+  Now(2024, 6, 10, 10);
+  SentDate(2024, 6, 8);
+  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 9, 23, 59, 59, 500),
+      "'m.late',0");
+  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 9, 23, 59, 59, 500), "'u.late',7");
+
+  ASSERT_EQ(builder.RunDaily(), 0);
+  EXPECT_TRUE(Bodies("003").empty());
+  EXPECT_EQ(Column(survey, "SELECT installed_app_id FROM manage_app_survey"),
+            std::vector<std::string>{"m.late"});
+  // The slices reach midnight, so the usage row of the same instant is reported.
+  ASSERT_EQ(Bodies("001").size(), 1u);
+  EXPECT_NE(Bodies("001")[0].find("¶app_id=u.late¶duration=7"), std::string::npos);
+
+  Now(2024, 6, 11, 10);
+  ASSERT_EQ(builder.RunDaily(), 0);
+  EXPECT_TRUE(Bodies("003").empty());
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"), std::vector<std::string>{"0"});
+}
+
+TEST_F(ReportBuilderTest, QuotesAndCommasFromOutsideCallersStayInTheirOwnRecord) {
+  Now(2024, 6, 12, 10);
+  SentDate(2024, 6, 10);
+  WriteFile("/sys/class/dmi/id/product_name", "Gear, Rev 'B'\n");
+  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'it''s',5");
+  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'x,y',700");
+  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'z.ok',9");
+  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 5),
+      "'lm','CAPT','a''b',1");
+
+  ASSERT_EQ(builder.RunDaily(), 0);
+
+  const std::string head = "mcc=¶mnc=¶did=¶model=Gear; Rev 'B'¶fw_ver=W2.3-K9¶";
+  const std::string date = "date=2024-06-11T03:00:00+0200¶";
+  // The comma splits "x,y": that record's later fields shift and its surplus tail is dropped.
+  EXPECT_EQ(Bodies("001"),
+            (std::vector<std::string>{head + date + "sum=3¶count=1¶app_id=it's¶duration=5",
+                                      head + date + "sum=3¶count=700¶app_id=x¶duration=1",
+                                      head + date + "sum=3¶count=1¶app_id=z.ok¶duration=9"}));
+  EXPECT_EQ(Bodies("002"),
+            std::vector<std::string>{head + "date=2024-06-11T06:00:00+0200¶sum=3¶count=1¶"
+                                            "app_id=lm¶feature=CAPT¶extra=a'b¶value=1"});
+  EXPECT_EQ(Column(upload, "SELECT count(*) FROM survey_log WHERE body LIKE '%,%'"),
+            std::vector<std::string>{"0"});
+  EXPECT_EQ(Bodies("007").size(), 1u);
+}
+
+TEST_F(ReportBuilderTest, WindowsTileTheDayAcrossSummerTime) {
+  struct Case {
+    int month, day, mode, offset, length;
+    int64_t start, end;
+  } cases[] = {
+      {6, 11, 0, 0, 0, LocalMs(2024, 6, 11), LocalMs(2024, 6, 11, 23, 59, 59)},
+      {6, 11, 2, 21, 3, LocalMs(2024, 6, 11, 21), LocalMs(2024, 6, 12)},
+      {3, 31, 2, 0, 3, LocalMs(2024, 3, 31), LocalMs(2024, 3, 31, 3)},  // 02:00 does not exist
+      {3, 31, 2, 21, 3, LocalMs(2024, 3, 31, 21), LocalMs(2024, 4, 1)},
+      {10, 27, 2, 0, 24, LocalMs(2024, 10, 27), LocalMs(2024, 10, 28)},  // 25-hour day
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(std::to_string(c.month) + "/" + std::to_string(c.day) + " offset " +
+                 std::to_string(c.offset));
+    builder.ComputeWindow(static_cast<time_t>(LocalMs(2024, c.month, c.day) / 1000), c.mode,
+                          c.offset, c.length);
+    EXPECT_EQ(builder.WindowStart(), std::to_string(c.start));
+    EXPECT_EQ(builder.WindowEnd(), std::to_string(c.end));
+  }
+}
+
+}  // namespace
+}  // namespace _CorvaneLogManager
+
+#endif  // storage/db_connection.cc

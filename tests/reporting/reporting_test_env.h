@@ -1,0 +1,121 @@
+// Fixture of the reporting tests: a temp sysroot with real database files, the real registry and
+// managers, a fixed time zone and an injectable clock.
+#ifndef LOGMGR_TESTS_REPORTING_REPORTING_TEST_ENV_H_
+#define LOGMGR_TESTS_REPORTING_REPORTING_TEST_ENV_H_
+
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+#include <stdlib.h>
+#include <sys/stat.h>
+#include <time.h>
+
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "db_connection.h"
+#include "log_manager.h"
+#include "provider_registry.h"
+#include "storage/db_manager.h"
+#include "storage/pref_store.h"
+
+namespace _CorvaneLogManager {
+
+inline int64_t g_testNowMs = 0;
+inline int64_t TestClock() { return g_testNowMs; }
+
+class ReportingTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    setenv("TZ", "Europe/Berlin", 1);
+    tzset();
+    // No telephony service: the operator codes stay unknown unless a test brings a bus.
+    setenv("DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/nonexistent/bus", 1);
+    char tmpl[] = "/tmp/logmgr-reporting-XXXXXX";
+    ASSERT_NE(mkdtemp(tmpl), nullptr);
+    sysroot = tmpl;
+    ASSERT_EQ(system(("mkdir -p " + sysroot + "/opt/usr/dbspace " + sysroot + "/etc " + sysroot +
+                      "/sys/class/dmi/id")
+                         .c_str()),
+              0);
+    WriteFile("/etc/os-release", "NAME=\"Test OS\"\nVERSION_ID=\"12\"\nBUILD_ID=W2.3-K9\n");
+    WriteFile("/sys/class/dmi/id/product_name", "Gear-X1\n");
+    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
+
+    ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
+    ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
+    ASSERT_EQ(UploadDbManager::GetInstance()->Init(), 0);
+    survey = DbManager::GetInstance()->GetConnection();
+    upload = UploadDbManager::GetInstance()->GetConnection();
+    ASSERT_EQ(prefs.Create(), 0);
+    SetRuntimeSwitch(1, true);
+  }
+
+  void TearDown() override {
+    (void)prefs.Close();
+    ProviderRegistry::Release();
+    DbManager::CloseInstance();
+    UploadDbManager::CloseInstance();
+    unsetenv("LOGMGR_SYSROOT");
+    (void)system(("rm -rf " + sysroot).c_str());
+  }
+
+  void WriteFile(const std::string& fixedPath, const std::string& text) {
+    std::ofstream(sysroot + fixedPath, std::ios::binary) << text;
+  }
+  std::string ReadFile(const std::string& fixedPath) {
+    std::ifstream in(sysroot + fixedPath, std::ios::binary);
+    std::stringstream text;
+    text << in.rdbuf();
+    return text.str();
+  }
+  std::vector<std::string> OutboxLines() {
+    std::vector<std::string> lines;
+    std::istringstream in(ReadFile("/opt/usr/data/log-relay/outbox.jsonl"));
+    for (std::string line; std::getline(in, line);) lines.push_back(line);
+    return lines;
+  }
+
+  // Local time of a calendar date in the fixed zone, in ms.
+  static int64_t LocalMs(int year, int month, int day, int hour = 0, int minute = 0,
+                         int second = 0, int ms = 0) {
+    struct tm tm = {};
+    tm.tm_year = year - 1900;
+    tm.tm_mon = month - 1;
+    tm.tm_mday = day;
+    tm.tm_hour = hour;
+    tm.tm_min = minute;
+    tm.tm_sec = second;
+    tm.tm_isdst = -1;
+    return static_cast<int64_t>(mktime(&tm)) * 1000 + ms;
+  }
+
+  void Exec(DbConnection* conn, const std::string& sql) {
+    char* error = nullptr;
+    ASSERT_EQ(sqlite3_exec(conn->Handle(), sql.c_str(), nullptr, nullptr, &error), SQLITE_OK)
+        << sql << ": " << (error ? error : "");
+  }
+  // Column 0 of every row, as text.
+  std::vector<std::string> Column(DbConnection* conn, const std::string& sql) {
+    std::vector<std::string> out;
+    sqlite3_stmt* stmt = nullptr;
+    EXPECT_EQ(sqlite3_prepare_v2(conn->Handle(), sql.c_str(), -1, &stmt, nullptr), SQLITE_OK)
+        << sql;
+    while (stmt != nullptr && sqlite3_step(stmt) == SQLITE_ROW) {
+      const unsigned char* text = sqlite3_column_text(stmt, 0);
+      out.push_back(text ? reinterpret_cast<const char*>(text) : "<null>");
+    }
+    sqlite3_finalize(stmt);
+    return out;
+  }
+
+  std::string sysroot;
+  DbConnection* survey = nullptr;
+  DbConnection* upload = nullptr;
+  PrefStore prefs;
+};
+
+}  // namespace _CorvaneLogManager
+
+#endif  // LOGMGR_TESTS_REPORTING_REPORTING_TEST_ENV_H_
