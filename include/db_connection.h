@@ -4,7 +4,10 @@
 #ifndef LOGMGR_INCLUDE_DB_CONNECTION_H_
 #define LOGMGR_INCLUDE_DB_CONNECTION_H_
 
+#include <pthread.h>
 #include <stdint.h>
+
+#include <atomic>
 
 struct sqlite3;
 
@@ -15,7 +18,8 @@ class DbConnection {
   DbConnection() = default;
   ~DbConnection() = default;  // closing is explicit
 
-  // 0 if opened or already open; -1 on failure. The path is a fixed device path.
+  // 0 if opened or already open; -1 on failure. |path| is a real file path: callers map the
+  // device path with logmgr_fixed_path first.
   int Open(const char* path);
   int Exec(const char* sql);
   // 1 if exactly one schema object of that name exists, else 0.
@@ -28,8 +32,12 @@ class DbConnection {
   // has room for Count(table) rows; with a row count above 0 the caller frees each row and
   // the array (delete[]); with 0 nothing is left to free.
   int Select(const char* sql, const char* table, int* rowCount, char*** rows);
+  // Low 32 bits of the last insert row id; -1 when closed.
   int LastInsertRowId();
+  // Rows changed by the last statement; -1 when closed.
   int Changes();
+  // Called from another thread: the statement running on this connection, or the next one to
+  // start, fails as interrupted and ends the thread that runs it.
   void Interrupt();
   int Close();
   void ReportError();
@@ -37,7 +45,21 @@ class DbConnection {
   sqlite3* Handle() const { return db; }
 
  private:
+  static int OnProgress(void* self);
+  // True when a statement on the calling thread must stop: an interrupt is pending and was
+  // requested by another thread.
+  bool StopRequestedForThisThread() const;
+  // Statement-helper prologue: disables cancellation and ends the thread when an interrupt is
+  // already pending (sqlite3_interrupt alone would lose it).
+  void BeginStatement();
+  [[noreturn]] void EndInterruptedThread();
+  // First column of the last row of |sql|; 0 on failure.
+  int64_t ScalarQuery(const char* sql);
+
   sqlite3* db = nullptr;
+  // Pending interrupt; consumed by the statement it ends, dropped by Close.
+  std::atomic<bool> stopRequested{false};
+  std::atomic<pthread_t> stopRequester{};
 };
 
 // Process-wide encryption switch: off at start and never turned on by the daemon.
