@@ -1,12 +1,21 @@
-// Seam: filled in by the providers layer.
 #include "provider_registry.h"
 
 #include <new>
 
+#include "providers/server_upload_log_provider.h"
+#include "providers/survey_log_providers.h"
+#include "storage/db_manager.h"
+
 namespace _CorvaneLogManager {
 
 namespace {
+
 ProviderRegistry* g_registry = nullptr;
+
+const char* const kKeys[] = {"use_app_survey",          "use_app_feature_survey",
+                             "report_app_status_survey", "report_app_error_survey",
+                             "manage_app_survey",        "server_upload"};
+
 }  // namespace
 
 ProviderRegistry* ProviderRegistry::GetInstance() {
@@ -15,12 +24,72 @@ ProviderRegistry* ProviderRegistry::GetInstance() {
 }
 
 void ProviderRegistry::Release() {
+  if (g_registry != nullptr) g_registry->Teardown();
   delete g_registry;
   g_registry = nullptr;
 }
 
 ProviderRegistry::~ProviderRegistry() {}
-int ProviderRegistry::CreateProviders() { return 0; }
-BaseLogProvider* ProviderRegistry::Lookup(const char*) { return nullptr; }
+
+int ProviderRegistry::CreateProviders() {
+  useApp = new (std::nothrow) UseAppSurveyLogProvider();
+  manageApp = new (std::nothrow) ManageAppSurveyLogProvider();
+  useAppFeature = new (std::nothrow) UseAppFeatureSurveyLogProvider();
+  reportAppStatus = new (std::nothrow) ReportAppStatusSurveyLogProvider();
+  appError = new (std::nothrow) AppErrorSurveyLogProvider();
+  serverUpload = new (std::nothrow) ServerUploadLogProvider();
+
+  BaseLogProvider* const ordered[] = {useApp,   useAppFeature, reportAppStatus,
+                                      appError, manageApp,     serverUpload};
+  bool complete = true;
+  for (BaseLogProvider* provider : ordered) complete = complete && provider != nullptr;
+  if (!complete) {
+    for (BaseLogProvider* provider : ordered) delete provider;
+    useApp = nullptr;
+    useAppFeature = nullptr;
+    reportAppStatus = nullptr;
+    appError = nullptr;
+    manageApp = nullptr;
+    serverUpload = nullptr;
+    return -1;
+  }
+
+  DbManager* survey = DbManager::GetInstance();
+  UploadDbManager* upload = UploadDbManager::GetInstance();
+  for (int i = 0; i < 6; ++i) {
+    if (i < 5) {
+      if (survey != nullptr) survey->AddListener(ordered[i]);
+    } else if (upload != nullptr) {
+      upload->AddListener(ordered[i]);
+    }
+    providers[kKeys[i]] = ordered[i];
+  }
+  return 0;
+}
+
+BaseLogProvider* ProviderRegistry::Lookup(const char* name) {
+  // Subscript on purpose: an unknown name stays in the map with a null provider.
+  return providers[name == nullptr ? "" : name];
+}
+
+void ProviderRegistry::Teardown() {
+  BaseLogProvider* const ordered[] = {useApp,   useAppFeature, reportAppStatus,
+                                      appError, manageApp,     serverUpload};
+  DbManager* survey = DbManager::GetInstance();
+  UploadDbManager* upload = UploadDbManager::GetInstance();
+  for (int i = 0; i < 5; ++i)
+    if (survey != nullptr) survey->RemoveListener(ordered[i]);
+  if (upload != nullptr) upload->RemoveListener(serverUpload);
+
+  for (const char* key : kKeys) providers.erase(key);
+  for (BaseLogProvider* provider : ordered) delete provider;
+  useApp = nullptr;
+  useAppFeature = nullptr;
+  reportAppStatus = nullptr;
+  appError = nullptr;
+  manageApp = nullptr;
+  serverUpload = nullptr;
+  providers.clear();
+}
 
 }  // namespace _CorvaneLogManager

@@ -1,18 +1,54 @@
-// Seam: filled in by the storage layer.
 #include "storage/db_manager.h"
 
+#include <limits.h>
+
+#include <algorithm>
 #include <new>
+
+#include "base_log_provider.h"
+#include "db_connection.h"
+#include "platform/fixed_path.h"
 
 namespace _CorvaneLogManager {
 
 namespace {
+
+const char* const kSurveyDbPath = "/opt/usr/dbspace/.SurveyLog.db";
+const char* const kUploadDbPath = "/opt/usr/dbspace/.ServerUploaderDB.db";
+
 DbManager* g_dbManager = nullptr;
 UploadDbManager* g_uploadDbManager = nullptr;
+
+// The paths stay as on the device; the host maps them beneath its sysroot.
+int OpenFixed(DbConnection* connection, const char* path) {
+  char buf[PATH_MAX];
+  return connection->Open(logmgr_fixed_path(path, buf, sizeof(buf)));
+}
+
+void Remove(std::vector<IDbResponseListener*>* listeners, IDbResponseListener* listener) {
+  auto it = std::find(listeners->begin(), listeners->end(), listener);
+  if (it != listeners->end()) listeners->erase(it);
+}
+
+// Listeners are providers; anything else has no table to create or trim.
+void InitializeAll(const std::vector<IDbResponseListener*>& listeners) {
+  for (IDbResponseListener* listener : listeners) {
+    BaseLogProvider* provider = dynamic_cast<BaseLogProvider*>(listener);
+    if (provider != nullptr) (void)provider->Initialize();
+  }
+}
+
 }  // namespace
 
 DbManager* DbManager::GetInstance() {
-  if (g_dbManager == nullptr) g_dbManager = new (std::nothrow) DbManager();
-  return g_dbManager;
+  if (g_dbManager != nullptr) return g_dbManager;
+  DbManager* manager = new (std::nothrow) DbManager();
+  if (manager == nullptr) return nullptr;
+  manager->connection = new (std::nothrow) DbConnection();
+  // The manager is abandoned, not freed, on this out-of-memory path (deliberate).
+  if (manager->connection == nullptr) return nullptr;
+  g_dbManager = manager;
+  return manager;
 }
 
 void DbManager::CloseInstance() {
@@ -20,16 +56,46 @@ void DbManager::CloseInstance() {
   g_dbManager = nullptr;
 }
 
-int DbManager::Init() { return 0; }
-DbManager::~DbManager() {}
-void DbManager::AddListener(IDbResponseListener* l) { listeners.push_back(l); }
-void DbManager::RemoveListener(IDbResponseListener*) {}
-int DbManager::NotifyInitialize() { return 0; }
-int DbManager::NotifyDeleteExpired() { return 0; }
+DbManager::~DbManager() {
+  listeners.clear();
+  if (connection != nullptr) {
+    (void)connection->Close();
+    delete connection;
+  }
+}
+
+int DbManager::Init() {
+  // The connection exists whenever GetInstance handed out the manager.
+  if (OpenFixed(connection, kSurveyDbPath) != 0) return -1;
+  InitializeAll(listeners);
+  return 0;
+}
+
+void DbManager::AddListener(IDbResponseListener* listener) { listeners.push_back(listener); }
+
+void DbManager::RemoveListener(IDbResponseListener* listener) { Remove(&listeners, listener); }
+
+int DbManager::NotifyInitialize() {
+  InitializeAll(listeners);
+  return 0;
+}
+
+int DbManager::NotifyDeleteExpired() {
+  for (IDbResponseListener* listener : listeners) {
+    BaseLogProvider* provider = dynamic_cast<BaseLogProvider*>(listener);
+    if (provider != nullptr) (void)provider->DeleteExpiredRows();
+  }
+  return 0;
+}
 
 UploadDbManager* UploadDbManager::GetInstance() {
-  if (g_uploadDbManager == nullptr) g_uploadDbManager = new (std::nothrow) UploadDbManager();
-  return g_uploadDbManager;
+  if (g_uploadDbManager != nullptr) return g_uploadDbManager;
+  UploadDbManager* manager = new (std::nothrow) UploadDbManager();
+  if (manager == nullptr) return nullptr;
+  manager->connection = new (std::nothrow) DbConnection();
+  if (manager->connection == nullptr) return nullptr;  // abandoned, as above
+  g_uploadDbManager = manager;
+  return manager;
 }
 
 void UploadDbManager::CloseInstance() {
@@ -37,10 +103,35 @@ void UploadDbManager::CloseInstance() {
   g_uploadDbManager = nullptr;
 }
 
-int UploadDbManager::Init() { return 0; }
-UploadDbManager::~UploadDbManager() {}
-void UploadDbManager::AddListener(IDbResponseListener* l) { listeners.push_back(l); }
-void UploadDbManager::RemoveListener(IDbResponseListener*) {}
-int UploadDbManager::NotifyInitialize() { return 0; }
+UploadDbManager::~UploadDbManager() {
+  listeners.clear();
+  (void)CloseConnection();
+  delete connection;
+}
+
+int UploadDbManager::CloseConnection() {
+  if (connection == nullptr) return -1;
+  return connection->Close();
+}
+
+int UploadDbManager::Init() {
+  if (connection == nullptr) return -1;
+  if (OpenFixed(connection, kUploadDbPath) != 0) return -1;
+  InitializeAll(listeners);
+  return 0;
+}
+
+void UploadDbManager::AddListener(IDbResponseListener* listener) {
+  listeners.push_back(listener);
+}
+
+void UploadDbManager::RemoveListener(IDbResponseListener* listener) {
+  Remove(&listeners, listener);
+}
+
+int UploadDbManager::NotifyInitialize() {
+  InitializeAll(listeners);
+  return 0;
+}
 
 }  // namespace _CorvaneLogManager

@@ -1,0 +1,256 @@
+#include "base_log_provider.h"
+
+#include <stdio.h>
+#include <string.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include "db_connection.h"
+#include "platform/fixed_path.h"
+#include "providers/statement_buffer.h"
+#include "storage/db_manager.h"
+
+namespace _CorvaneLogManager {
+
+namespace {
+
+// Row counts are checked against this many oldest rows and seeded modulo it, whatever the
+// table's own check interval says.
+constexpr int kTrimBatch = 500;
+constexpr long long kMsPerDay = 86400000LL;
+// Length of "/usr/share/zoneinfo/", skipped (not compared) in front of the zone name.
+constexpr size_t kZoneinfoPrefix = 20;
+
+long long NowMs() {
+  struct timeval tv;
+  gettimeofday(&tv, nullptr);
+  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
+}
+
+DbConnection* SurveyConnection() {
+  DbManager* manager = DbManager::GetInstance();
+  return manager == nullptr ? nullptr : manager->GetConnection();
+}
+
+}  // namespace
+
+int BaseLogProvider::InitTableConfig(const char* tableName, const char* columnList,
+                                     int32_t retentionDays, int32_t checkInterval,
+                                     int32_t maxRows, int32_t initialCounter) {
+  config.tableName = tableName;
+  config.retention_days = retentionDays;
+  config.check_interval = checkInterval;
+  config.max_rows = maxRows;
+  config.insert_counter = initialCounter;
+
+  char buf[kListSize];
+  CopyListOrDie(buf, columnList);
+  char* save = nullptr;
+  for (char* tok = strtok_r(buf, ", ", &save); tok != nullptr; tok = strtok_r(nullptr, ", ", &save))
+    config.columns.push_back(tok);
+  return 0;
+}
+
+int BaseLogProvider::ValidateColumns(const char* columnList) {
+  if (columnList == nullptr) return 0;
+  char buf[kListSize];
+  CopyListOrDie(buf, columnList);
+  char* save = nullptr;
+  char* tok = strtok_r(buf, ",", &save);
+  if (tok == nullptr || config.columns.empty()) return -1;
+  for (; tok != nullptr; tok = strtok_r(nullptr, ",", &save)) {
+    bool declared = false;
+    for (const std::string& column : config.columns) {
+      if (column == tok) {
+        declared = true;
+        break;
+      }
+    }
+    if (!declared) return -1;
+  }
+  return 0;
+}
+
+void BaseLogProvider::AppendAutoColumns(std::string* columns, std::string* values) {
+  for (const std::string& column : config.columns) {
+    if (column == "timestamp") {
+      char now[32];
+      snprintf(now, sizeof(now), ",%lld", NowMs());
+      columns->append(",timestamp");
+      values->append(now);
+    } else if (column == "time_zone") {
+      char pathBuf[4096];
+      const char* link = logmgr_fixed_path("/opt/etc/localtime", pathBuf, sizeof(pathBuf));
+      char target[1024];
+      ssize_t len = readlink(link, target, sizeof(target) - 1);
+      if (len <= static_cast<ssize_t>(kZoneinfoPrefix)) continue;  // unreadable or no zone
+      target[len] = '\0';
+      columns->append(",time_zone");
+      values->append(",'");
+      values->append(target + kZoneinfoPrefix);
+      values->append("'");
+    }
+  }
+}
+
+int32_t BaseLogProvider::AdvanceInsertCounter() {
+  config.insert_counter = (config.insert_counter + 1) % config.check_interval;
+  return config.insert_counter;
+}
+
+int32_t BaseLogProvider::TickInsertCounter() {
+  config.insert_counter = (config.insert_counter + 1) % config.check_interval;
+  return config.insert_counter == 1 ? config.check_interval : 0;
+}
+
+int BaseLogProvider::Initialize() {
+  DbConnection* conn = SurveyConnection();
+  if (conn == nullptr) return 0;
+  if (conn->Exec(GetCreateTableSql()) != 0) return -1;
+  if (conn->TableExists(config.tableName.c_str()) == 1)
+    config.insert_counter = GetRowCount() % kTrimBatch;
+  else
+    config.insert_counter = 0;
+  // The seeded counter, not a plain status: callers only test for -1.
+  return config.insert_counter;
+}
+
+int BaseLogProvider::DeleteExpiredRows() {
+  DbConnection* conn = SurveyConnection();
+  if (conn == nullptr) return 0;
+  char where[50];
+  snprintf(where, sizeof(where), "timestamp < %lld",
+           NowMs() - static_cast<long long>(config.retention_days) * kMsPerDay);
+  char sql[kStatementSize];
+  snprintf(sql, sizeof(sql), "DELETE FROM %s WHERE %s;", config.tableName.c_str(), where);
+  return conn->Exec(sql) == 0 ? 0 : -1;
+}
+
+int BaseLogProvider::InsertRow(const char* columns, const char* values, int32_t* rowId) {
+  return InsertOn(SurveyConnection(), columns, values, rowId, true);
+}
+
+int BaseLogProvider::InsertOn(DbConnection* conn, const char* columns, const char* values,
+                              int32_t* rowId, bool countRows) {
+  if (conn == nullptr || columns == nullptr || values == nullptr) return -1;
+  std::string columnText(columns);
+  std::string valueText(values);
+  if (columnText.empty() || valueText.empty()) return -1;
+  if (ValidateColumns(columnText.c_str()) != 0) return -1;
+  AppendAutoColumns(&columnText, &valueText);
+  int32_t check = countRows ? TickInsertCounter() : 0;
+
+  char sql[kStatementSize];
+  snprintf(sql, sizeof(sql), "INSERT INTO %s(%s) VALUES (%s);", config.tableName.c_str(),
+           columnText.c_str(), valueText.c_str());
+  int result = conn->Exec(sql);
+  if (rowId != nullptr) *rowId = result == 0 ? conn->LastInsertRowId() : -1;
+  if (result != 0) return -1;
+  // Counting rows costs a full scan, so only the insert that wraps the counter does it.
+  if (check > 0 && GetRowCount() > config.max_rows) (void)DeleteOldestRows();
+  return 0;
+}
+
+int BaseLogProvider::UpdateRows(const char* columns, const char* values, const char* where,
+                                int32_t* count) {
+  return UpdateOn(SurveyConnection(), columns, values, where, count, true, ",");
+}
+
+int BaseLogProvider::UpdateOn(DbConnection* conn, const char* columns, const char* values,
+                              const char* where, int32_t* count, bool autoColumns,
+                              const char* splitDelims) {
+  if (conn == nullptr || columns == nullptr || values == nullptr) return -1;
+  std::string columnText(columns);
+  std::string valueText(values);
+  if (columnText.empty() || valueText.empty() || where == nullptr) return -1;
+  if (ValidateColumns(columnText.c_str()) != 0) return -1;
+  if (autoColumns) AppendAutoColumns(&columnText, &valueText);
+
+  char columnBuf[kListSize];
+  char valueBuf[kListSize];
+  CopyListOrDie(columnBuf, columnText.c_str());
+  CopyListOrDie(valueBuf, valueText.c_str());
+
+  char set[kStatementSize] = "";
+  char* columnSave = nullptr;
+  char* valueSave = nullptr;
+  char* column = strtok_r(columnBuf, splitDelims, &columnSave);
+  char* value = strtok_r(valueBuf, splitDelims, &valueSave);
+  // Surplus tokens of the longer list are ignored; a value holding a delimiter is split.
+  while (column != nullptr && value != nullptr) {
+    char pair[kStatementSize];
+    snprintf(pair, sizeof(pair), value[0] == '\'' ? "%s = %s," : "%s = '%s',", column, value);
+    AppendOrDie(set, sizeof(set), pair);
+    column = strtok_r(nullptr, splitDelims, &columnSave);
+    value = strtok_r(nullptr, splitDelims, &valueSave);
+  }
+  size_t setLen = strlen(set);
+  if (setLen > 0) set[setLen - 1] = '\0';
+
+  char sql[kStatementSize];
+  snprintf(sql, sizeof(sql), "UPDATE %s SET %s WHERE %s;", config.tableName.c_str(), set, where);
+  int result = conn->Exec(sql);
+  if (count != nullptr) *count = result == 0 ? conn->Changes() : 0;
+  return result == 0 ? 0 : -1;
+}
+
+int BaseLogProvider::SelectRows(const char* columns, const char* where, const char* orderBy,
+                                int* rowCount, char*** rows) {
+  return SelectGroupedRows(columns, where, orderBy, nullptr, rowCount, rows);
+}
+
+int BaseLogProvider::SelectGroupedRows(const char* columns, const char* where,
+                                       const char* orderBy, const char* groupBy, int* rowCount,
+                                       char*** rows) {
+  DbConnection* conn = SurveyConnection();
+  if (conn == nullptr) return -1;
+  char sql[kStatementSize];
+  char piece[kStatementSize];
+  snprintf(sql, sizeof(sql), "SELECT %s FROM %s", columns == nullptr ? "*" : columns,
+           config.tableName.c_str());
+  if (where != nullptr) {
+    snprintf(piece, sizeof(piece), " WHERE %s", where);
+    AppendOrDie(sql, sizeof(sql), piece);
+  }
+  if (groupBy != nullptr) {
+    snprintf(piece, sizeof(piece), " GROUP BY %s", groupBy);
+    AppendOrDie(sql, sizeof(sql), piece);
+  }
+  if (orderBy != nullptr) {
+    snprintf(piece, sizeof(piece), " ORDER BY %s", orderBy);
+    AppendOrDie(sql, sizeof(sql), piece);
+  }
+  AppendOrDie(sql, sizeof(sql), ";");
+  return conn->Select(sql, config.tableName.c_str(), rowCount, rows);
+}
+
+int BaseLogProvider::DeleteRows(const char* where, int32_t* count) {
+  return DeleteOn(SurveyConnection(), where, count);
+}
+
+int BaseLogProvider::DeleteOn(DbConnection* conn, const char* where, int32_t* count) {
+  if (conn == nullptr || where == nullptr) return -1;
+  char sql[kStatementSize];
+  snprintf(sql, sizeof(sql), "DELETE FROM %s WHERE %s;", config.tableName.c_str(), where);
+  int result = conn->Exec(sql);
+  if (count != nullptr) *count = result == 0 ? conn->Changes() : 0;
+  return result == 0 ? 0 : -1;
+}
+
+int BaseLogProvider::GetRowCount() {
+  DbConnection* conn = SurveyConnection();
+  if (conn == nullptr) return -1;
+  return conn->Count(config.tableName.c_str());
+}
+
+int BaseLogProvider::DeleteOldestRows() { return DeleteOldestOn(SurveyConnection()); }
+
+int BaseLogProvider::DeleteOldestOn(DbConnection* conn) {
+  if (conn == nullptr) return -1;
+  char sql[kStatementSize];
+  snprintf(sql, sizeof(sql), "DELETE FROM %s WHERE _id < (SELECT MIN(_id) FROM %s) + %d;",
+           config.tableName.c_str(), config.tableName.c_str(), kTrimBatch);
+  return conn->Exec(sql) == 0 ? 0 : -1;
+}
+
+}  // namespace _CorvaneLogManager

@@ -1,0 +1,32 @@
+// Fixed-buffer helpers shared by the providers. A list or an appended clause that would not
+// fit ends the process (abort) before anything is written past the buffer.
+#ifndef LOGMGR_PROVIDERS_STATEMENT_BUFFER_H_
+#define LOGMGR_PROVIDERS_STATEMENT_BUFFER_H_
+
+#include <stddef.h>
+#include <stdlib.h>
+#include <string.h>
+
+namespace _CorvaneLogManager {
+
+constexpr size_t kStatementSize = 1024;
+constexpr size_t kListSize = 200;
+
+// Copies |text| into |buf| (kListSize bytes); 200 characters or more is fatal.
+inline void CopyListOrDie(char* buf, const char* text) {
+  size_t len = strlen(text);
+  if (len >= kListSize) abort();
+  memcpy(buf, text, len + 1);
+}
+
+// Appends |piece| to the NUL-terminated text in |buf| of |size| bytes; not fitting is fatal.
+inline void AppendOrDie(char* buf, size_t size, const char* piece) {
+  size_t used = strlen(buf);
+  size_t len = strlen(piece);
+  if (used + len >= size) abort();
+  memcpy(buf + used, piece, len + 1);
+}
+
+}  // namespace _CorvaneLogManager
+
+#endif  // LOGMGR_PROVIDERS_STATEMENT_BUFFER_H_
