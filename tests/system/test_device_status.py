@@ -265,7 +265,7 @@ class BluetoothTest(DeviceStatusCase):
 
 
 class RestartTest(DeviceStatusCase):
-    def test_open_periods_are_closed_on_the_next_start(self):
+    def test_crash_closes_at_the_latest_row(self):
         clock = FrozenClock(self.dev)
         self.dev.vconf_set("memory/pm/state", "int", "1")
         first = self.start(clock)
@@ -283,7 +283,15 @@ class RestartTest(DeviceStatusCase):
                                         "WHERE feature = 'SCRN'"), [(10000,)])
         self.assertEqual(self.snapshot("SCRN"), ("", clock.ms()))
 
-        # Clean stop with a charger and a headset plugged in while the daemon is away.
+    def test_clean_stop_closes_at_the_recorded_shutdown_time(self):
+        clock = FrozenClock(self.dev)
+        self.dev.vconf_set("memory/pm/state", "int", "1")
+        self.start(clock)
+        clock.advance(100)
+        self.dev.devsim("capture")
+        wait_for(lambda: self.rows("CAPT"), message="CAPT")
+
+        # Charger and headset plugged in while the daemon is away; the last row is older.
         clock.advance(100)
         self.dev.signal(signal.SIGTERM)
         self.dev.wait_exit()
@@ -292,8 +300,7 @@ class RestartTest(DeviceStatusCase):
         self.dev.devsim("earjack", "in")
         self.start(clock)
         self.assertEqual(self.dev.query(FEATURE_DB, "SELECT value FROM use_app_feature_survey "
-                                        "WHERE feature = 'SCRN' ORDER BY _id"),
-                         [(10000,), (100000,)])
+                                        "WHERE feature = 'SCRN' ORDER BY _id"), [(200000,)])
         self.assertEqual(self.dev.query(".pref.db", "SELECT pref_data FROM pref WHERE "
                                         "pref_key = 'key_last_shutdown_time'"), [("0",)])
         # The initial snapshot samples the charger (after its wait) and the headset.
