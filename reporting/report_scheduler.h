@@ -1,25 +1,77 @@
-// ReportScheduler: decides when the daily report run happens and runs it on one worker thread.
+// ReportScheduler: decides when the daily report run happens and runs it on one worker thread;
+// once a week it also copies the status snapshot rows into the feature table.
 #ifndef LOGMGR_REPORTING_REPORT_SCHEDULER_H_
 #define LOGMGR_REPORTING_REPORT_SCHEDULER_H_
 
+#include <alarm.h>
+#include <pthread.h>
+#include <time.h>
+
 namespace _CorvaneLogManager {
+
+class ReportBuilder;
+class Uploader;
+
+// The process-wide pair of the report run: one builder, one uploader.
+struct ReportPair {
+  ReportBuilder* builder = nullptr;
+  Uploader* uploader = nullptr;
+
+  // Made on first request; a failed request still leaves the holder registered, so a later
+  // request returns it as it stands (deliberately no second attempt). Null on failure.
+  static ReportPair* Get();
+  static void Destroy();
+};
 
 class ReportScheduler {
  public:
+  enum Event { kDumpContext = 0, kTimeChanged = 1, kCheck = 2, kAlarm = 3 };
+
   // Zero the fields and obtain the report pair. 0 / -1.
   int Create();
   // Alarm, sent-date clamp, first due check, watches. Always 0.
   int Init();
   // Alarm removed, worker cancelled and joined, pair destroyed, watches removed.
   void Stop();
-  // The job body run when a worker ends: report and upload, weekly trim, busy flag cleared.
+  // Drops the event while a run is in progress or for an unknown kind.
+  void HandleEvent(int kind);
+  // The job body run on the worker: report and upload, weekly purge, running cleared.
   // -1 when there is no report pair.
   int RunJob();
   // True from the moment a run is decided until the worker has finished it.
   bool IsRunning() const { return running; }
+  alarm_id_t AlarmId() const { return alarmId; }
+
+  // Brings key_sent_date into range: on first start midnight yesterday; otherwise never more
+  // than four days back, and after a time change (forced) never in the future. 0 / -1.
+  int ClampSentDate(bool forced);
+  // Starts a run when key_sent_date is not midnight yesterday.
+  void CheckReportDue();
+
+  // Deliberately unwired: kept as part of the component's surface.
+  void AddRandomTimer();
+  int StampSurveyUpdate();
+  bool IsSurveyUpdateDue();
+  bool IsSentDateStale();
+
+  // Local midnight |days| days before today.
+  static time_t MidnightDaysAgo(int days);
 
  private:
+  void CreateAlarm(int interval);
+  void RegisterWatches();
+  void ResetAfterTimeChange();
+  void DumpContext();
+  void CheckWeeklyStatusCopy();
+  void CopyStatusSnapshot(long lowerBound);
+  void AddSdCardRow();
+  void CheckWeeklyPurge();
+
+  alarm_entry_t* alarmEntry = nullptr;
+  alarm_id_t alarmId = 0;
+  ReportPair* reportPair = nullptr;
   bool running = false;
+  pthread_t worker = 0;
 };
 
 }  // namespace _CorvaneLogManager

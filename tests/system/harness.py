@@ -51,6 +51,7 @@ class Device:
         if not with_x:
             self.env.pop("DISPLAY", None)
         self.daemon = None
+        self.procs = []
 
     # --- paths and files -------------------------------------------------------------------
     def path(self, fixed_path):
@@ -115,6 +116,7 @@ class Device:
         proc = subprocess.Popen(list(prefix) + [os.path.join(BIN_DIR, "logmgrd")], env=env,
                                 stdout=log, stderr=log, stdin=subprocess.DEVNULL)
         log.close()
+        self.procs.append(proc)
         if self.daemon is None:
             self.daemon = proc
         if wait_for_name:
@@ -138,9 +140,10 @@ class Device:
         (proc or self.daemon).send_signal(signum)
 
     def close(self):
-        for proc in [self.daemon]:
+        for proc in self.procs + [self.daemon]:
             if proc is not None and proc.poll() is None:
                 proc.send_signal(signal.SIGKILL)
+            if proc is not None:
                 proc.wait()
         subprocess.run([HOST_ENV, "stop", self.sysroot], capture_output=True)
         shutil.rmtree(self.sysroot, ignore_errors=True)

@@ -1,0 +1,169 @@
+"""The day cycle through the real daemon: when a report run starts, what it aggregates, and how
+it ends when the daemon is stopped or consent is withdrawn in the middle of it."""
+import json
+import os
+import signal
+import sqlite3
+import time
+
+from harness import DeviceTestCase, wait_for
+
+SURVEY_DB = ".SurveyLog.db"
+UPLOAD_DB = ".ServerUploaderDB.db"
+PREF_DB = ".pref.db"
+OUTBOX = "/opt/usr/data/log-relay/outbox.jsonl"
+
+
+def midnight(days_ago):
+    tm = time.localtime()
+    return int(time.mktime((tm.tm_year, tm.tm_mon, tm.tm_mday - days_ago, 0, 0, 0, 0, 0, -1)))
+
+
+class ReportCycleTest(DeviceTestCase):
+
+    def setUp(self):
+        os.environ["TZ"] = "UTC"
+        time.tzset()
+        super().setUp()
+        self.dev.env["TZ"] = "UTC"
+        self.dev.set_consent(True)
+
+    # --- helpers -------------------------------------------------------------------------
+    def connect(self, name):
+        con = sqlite3.connect(self.dev.db_path(name), timeout=10)
+        con.isolation_level = None
+        return con
+
+    def pref(self, key):
+        rows = self.dev.query(PREF_DB, "SELECT pref_data FROM pref WHERE pref_key=?", (key,))
+        return int(rows[0][0]) if rows else None
+
+    def set_pref(self, key, value):
+        con = self.connect(PREF_DB)
+        con.execute("INSERT OR REPLACE INTO pref VALUES(?,?)", (key, str(value)))
+        con.close()
+
+    def outbox(self):
+        path = self.dev.path(OUTBOX)
+        if not os.path.exists(path):
+            return []
+        with open(path) as f:
+            return [json.loads(line) for line in f if line.strip()]
+
+    def summaries(self):
+        """Dates of the daily size summaries handed to the relay, in order."""
+        out = []
+        for item in self.outbox():
+            if item["4"] == "007":
+                pairs = dict(p.split("=", 1) for p in item["7"].split("¶") if "=" in p)
+                out.append(pairs["date"][:10])
+        return out
+
+    def prepared_device(self):
+        """Runs the daemon once so its databases exist, then stops it."""
+        proc = self.dev.start_daemon()
+        wait_for(lambda: self.pref("key_sent_date") is not None, message="the first start")
+        proc.send_signal(signal.SIGTERM)
+        self.assertEqual(self.dev.wait_exit(proc), 0)
+
+    def seed_use_app(self, day_start, rows, apps=3):
+        con = self.connect(SURVEY_DB)
+        con.execute("BEGIN")
+        for i in range(rows):
+            ts = (day_start + 60 + (i * 10) % 86000) * 1000
+            con.execute("INSERT INTO use_app_survey(timestamp,time_zone,app_id,duration) "
+                        "VALUES(?,?,?,?)", (ts, "Etc/UTC", f"com.example.app{i % apps}", 1000 + i))
+        con.execute("COMMIT")
+        con.close()
+
+    def day_text(self, seconds):
+        return time.strftime("%Y-%m-%d", time.localtime(seconds))
+
+    # --- tests ---------------------------------------------------------------------------
+    def test_first_start_sets_yesterday_and_runs_nothing(self):
+        proc = self.dev.start_daemon()
+        wait_for(lambda: self.pref("key_sent_date") is not None, message="the sent date")
+        self.assertEqual(self.pref("key_sent_date"), midnight(1))
+        self.assertIsNone(proc.poll())
+        self.assertEqual(self.dev.query(UPLOAD_DB, "SELECT count(*) FROM survey_log"), [(0,)])
+        self.assertEqual(self.outbox(), [])
+
+    def test_ten_days_behind_aggregates_exactly_three_days_oldest_first(self):
+        self.prepared_device()
+        self.set_pref("key_sent_date", midnight(10))
+        for days_ago in (5, 3, 1):
+            self.seed_use_app(midnight(days_ago), 4)
+        self.dev.start_daemon()
+        wait_for(lambda: len(self.summaries()) == 3, timeout=30, message="three summaries")
+        self.assertEqual(self.summaries(), [self.day_text(midnight(d)) for d in (3, 2, 1)])
+        self.assertEqual(self.pref("key_sent_date"), midnight(1))
+        # The day five back was skipped for good; its rows stay until the purge takes them.
+        uses = [i for i in self.outbox() if i["4"] == "001"]
+        self.assertTrue(uses)
+        self.assertTrue(all(self.day_text(midnight(1)) in i["7"] or
+                            self.day_text(midnight(3)) in i["7"] for i in uses))
+        wait_for(lambda: self.dev.query(UPLOAD_DB, "SELECT count(*) FROM survey_log") == [(0,)],
+                 message="the queue to empty")
+
+    def test_time_change_to_the_past_resets_a_future_sent_date(self):
+        self.prepared_device()
+        self.set_pref("key_sent_date", midnight(-2))  # as if the clock had gone back two days
+        self.dev.start_daemon()
+        # The start's run aggregates nothing (no day is complete) and records its purge.
+        wait_for(lambda: (self.pref("key_delete_date") or 0) > 0, message="the start's run")
+
+        def reset():
+            self.dev.vconf_set("memory/system/timechanged", "int", str(int(time.time())))
+            return self.pref("key_sent_date") == midnight(1)
+        wait_for(reset, timeout=15, interval=0.2, message="the sent date reset")
+        # No run followed: the purge stays due.
+        self.assertEqual(self.pref("key_delete_date"), 0)
+        self.assertEqual(self.summaries(), [])
+
+    def test_dump_request_re_aggregates_the_last_day(self):
+        self.prepared_device()
+        self.seed_use_app(midnight(1), 5)
+        proc = self.dev.start_daemon()
+        self.assertEqual(self.pref("key_sent_date"), midnight(1))
+        self.dev.vconf_set("db/corvane-log-manager/dumpcontext", "int", "2")
+        wait_for(lambda: len(self.summaries()) == 1, timeout=30, message="one summary")
+        self.assertEqual(self.summaries(), [self.day_text(midnight(1))])
+        self.assertEqual(self.pref("key_sent_date"), midnight(1))
+        self.assertIsNone(proc.poll())
+
+    def long_run(self):
+        """A device whose last day needs thousands of records, with the run under way."""
+        self.prepared_device()
+        self.set_pref("key_sent_date", midnight(2))
+        self.seed_use_app(midnight(1), 4000, apps=4000)
+        proc = self.dev.start_daemon()
+        wait_for(lambda: self.dev.query(UPLOAD_DB, "SELECT count(*) FROM survey_log")[0][0] > 20,
+                 timeout=30, message="the run to be under way")
+        return proc
+
+    def test_sigterm_during_a_run_exits_quickly_and_keeps_every_row(self):
+        proc = self.long_run()
+        started = time.monotonic()
+        proc.send_signal(signal.SIGTERM)
+        self.assertEqual(self.dev.wait_exit(proc), 0)
+        elapsed = time.monotonic() - started
+        print(f"\n    SIGTERM during a run: exit after {elapsed * 1000:.0f} ms")
+        self.assertLess(elapsed, 3.0)
+        for db in (SURVEY_DB, UPLOAD_DB, PREF_DB):
+            self.assertEqual(self.dev.query(db, "PRAGMA integrity_check"), [("ok",)], db)
+        # The day was not finished: nothing of it was purged and it stays due.
+        self.assertEqual(self.dev.query(SURVEY_DB, "SELECT count(*) FROM use_app_survey"),
+                         [(4000,)])
+        self.assertEqual(self.pref("key_sent_date"), midnight(2))
+
+    def test_consent_withdrawn_during_a_run_lets_it_finish_then_exits(self):
+        proc = self.long_run()
+        self.dev.set_consent(False)
+        self.assertEqual(self.dev.wait_exit(proc, timeout=120), 0)
+        self.assertEqual(self.pref("key_sent_date"), midnight(1))
+        self.assertEqual(self.summaries(), [self.day_text(midnight(1))])
+
+
+if __name__ == "__main__":
+    import unittest
+    unittest.main()
