@@ -27,6 +27,25 @@ inline long long TestNowMs() {
   return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
 }
 
+// True if |text| is |pattern| with each '#' standing for a run of digits, collected in
+// |numbers| (a light stand-in for std::regex, which warns under the sanitizer build).
+inline bool MatchesWithNumbers(const std::string& text, const std::string& pattern,
+                               std::vector<long long>* numbers = nullptr) {
+  size_t t = 0;
+  for (char p : pattern) {
+    if (p != '#') {
+      if (t >= text.size() || text[t] != p) return false;
+      ++t;
+      continue;
+    }
+    size_t start = t;
+    while (t < text.size() && text[t] >= '0' && text[t] <= '9') ++t;
+    if (t == start) return false;
+    if (numbers != nullptr) numbers->push_back(std::stoll(text.substr(start, t - start)));
+  }
+  return t == text.size();
+}
+
 class StatementTrace {
  public:
   void Attach(DbConnection* conn) {

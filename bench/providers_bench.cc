@@ -1,0 +1,171 @@
+// InsertRow of a typical collector row against a bare prepared insert of the same row on the
+// same connection (same journal mode), on an empty table and at the 5,000-row limit where the
+// provider trims. Prints the ratios at the end.
+#include <benchmark/benchmark.h>
+#include <sqlite3.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <sys/stat.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <map>
+#include <string>
+
+#include "base_log_provider.h"
+#include "db_connection.h"
+#include "provider_registry.h"
+#include "storage/db_manager.h"
+
+using namespace _CorvaneLogManager;
+
+namespace {
+
+constexpr int kLimit = 5000;
+constexpr int kBatch = 500;
+
+std::string g_sysroot;
+BaseLogProvider* g_provider = nullptr;
+DbConnection* g_conn = nullptr;
+
+void Setup() {
+  char tmpl[] = "/tmp/logmgr-bench-XXXXXX";
+  if (mkdtemp(tmpl) == nullptr) abort();
+  g_sysroot = tmpl;
+  if (system(("mkdir -p " + g_sysroot + "/opt/usr/dbspace " + g_sysroot + "/opt/etc").c_str()) != 0)
+    abort();
+  if (symlink("/usr/share/zoneinfo/Europe/Berlin", (g_sysroot + "/opt/etc/localtime").c_str()))
+    abort();
+  setenv("LOGMGR_SYSROOT", g_sysroot.c_str(), 1);
+  if (DbManager::GetInstance() == nullptr || UploadDbManager::GetInstance() == nullptr ||
+      ProviderRegistry::GetInstance()->CreateProviders() != 0 ||
+      DbManager::GetInstance()->Init() != 0 || UploadDbManager::GetInstance()->Init() != 0)
+    abort();
+  g_provider = ProviderRegistry::GetInstance()->Lookup("use_app_survey");
+  g_conn = DbManager::GetInstance()->GetConnection();
+}
+
+void Teardown() {
+  ProviderRegistry::Release();
+  DbManager::CloseInstance();
+  UploadDbManager::CloseInstance();
+  (void)system(("rm -rf " + g_sysroot).c_str());
+}
+
+// Brings the table to |rows| rows and the provider's counter to what a restart would seed.
+void Prefill(int rows) {
+  g_conn->Exec("DELETE FROM use_app_survey;");
+  g_conn->Exec("BEGIN;");
+  for (int i = 0; i < rows; ++i)
+    g_conn->Exec("INSERT INTO use_app_survey(app_id,duration,timestamp) VALUES ('p',1,1);");
+  g_conn->Exec("COMMIT;");
+  (void)g_provider->Initialize();
+}
+
+long long NowMs() {
+  struct timeval tv;
+  gettimeofday(&tv, nullptr);
+  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
+}
+
+// Keeps an "empty" table near empty between batches (untimed).
+void MaybeEmpty(benchmark::State& state, int start, int64_t done) {
+  if (start == 0 && done % kBatch == 0) {
+    state.PauseTiming();
+    Prefill(0);
+    state.ResumeTiming();
+  }
+}
+
+void BM_InsertRow(benchmark::State& state) {
+  int start = static_cast<int>(state.range(0));
+  Prefill(start);
+  int64_t done = 0;
+  for (auto _ : state) {
+    if (g_provider->InsertRow("app_id,duration", "'com.example.clock',184230") != 0)
+      state.SkipWithError("insert failed");
+    MaybeEmpty(state, start, ++done);
+  }
+  state.counters["rows_at_end"] = g_conn->Count("use_app_survey");
+}
+
+void BM_BarePreparedInsert(benchmark::State& state) {
+  int start = static_cast<int>(state.range(0));
+  Prefill(start);
+  sqlite3_stmt* stmt = nullptr;
+  if (sqlite3_prepare_v2(g_conn->Handle(),
+                         "INSERT INTO use_app_survey(app_id,duration,timestamp,time_zone) "
+                         "VALUES (?,?,?,?);",
+                         -1, &stmt, nullptr) != SQLITE_OK)
+    abort();
+  int64_t done = 0;
+  for (auto _ : state) {
+    sqlite3_bind_text(stmt, 1, "com.example.clock", -1, SQLITE_STATIC);
+    sqlite3_bind_int64(stmt, 2, 184230);
+    sqlite3_bind_int64(stmt, 3, NowMs());
+    sqlite3_bind_text(stmt, 4, "Europe/Berlin", -1, SQLITE_STATIC);
+    if (sqlite3_step(stmt) != SQLITE_DONE) state.SkipWithError("insert failed");
+    sqlite3_reset(stmt);
+    MaybeEmpty(state, start, ++done);
+    // At the limit the bare table is held there too, untimed, so both see the same size.
+    if (start == kLimit && done % kBatch == 0) {
+      state.PauseTiming();
+      g_conn->Exec("DELETE FROM use_app_survey WHERE _id < (SELECT MIN(_id) FROM "
+                   "use_app_survey) + 500;");
+      state.ResumeTiming();
+    }
+  }
+  sqlite3_finalize(stmt);
+  state.counters["rows_at_end"] = g_conn->Count("use_app_survey");
+}
+
+BENCHMARK(BM_InsertRow)->Arg(0)->Arg(kLimit)->Iterations(2000)->Unit(benchmark::kMicrosecond);
+BENCHMARK(BM_BarePreparedInsert)
+    ->Arg(0)
+    ->Arg(kLimit)
+    ->Iterations(2000)
+    ->Unit(benchmark::kMicrosecond);
+
+class RatioReporter : public benchmark::ConsoleReporter {
+ public:
+  RatioReporter() : ConsoleReporter(OO_Tabular) {}
+  void ReportRuns(const std::vector<Run>& runs) override {
+    for (const Run& run : runs)
+      if (!run.error_occurred) {
+        wall[run.benchmark_name()] = run.GetAdjustedRealTime();
+        cpu[run.benchmark_name()] = run.GetAdjustedCPUTime();
+      }
+    ConsoleReporter::ReportRuns(runs);
+  }
+  std::map<std::string, double> wall;
+  std::map<std::string, double> cpu;
+};
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  benchmark::Initialize(&argc, argv);
+  Setup();
+  RatioReporter reporter;
+  benchmark::RunSpecifiedBenchmarks(&reporter);
+  Teardown();
+  // Wall time includes the journal's fsync, which dominates on a real disk; CPU time shows
+  // what the provider itself adds.
+  for (auto* times : {&reporter.wall, &reporter.cpu}) {
+    auto find = [&](const std::string& prefix) {
+      for (auto& [name, value] : *times)
+        if (name.rfind(prefix, 0) == 0) return value;
+      return 0.0;
+    };
+    double empty = find("BM_InsertRow/0"), full = find("BM_InsertRow/5000");
+    double bareEmpty = find("BM_BarePreparedInsert/0");
+    double bareFull = find("BM_BarePreparedInsert/5000");
+    if (empty <= 0 || full <= 0 || bareEmpty <= 0 || bareFull <= 0) continue;
+    const char* kind = times == &reporter.wall ? "wall" : "cpu ";
+    printf("%s InsertRow / bare insert, empty table:     %.2f\n", kind, empty / bareEmpty);
+    printf("%s InsertRow / bare insert, at 5,000 rows:   %.2f\n", kind, full / bareFull);
+    printf("%s InsertRow at 5,000 rows / empty table:    %.2f\n", kind, full / empty);
+  }
+  benchmark::Shutdown();
+  return 0;
+}
