@@ -1,0 +1,206 @@
+"""The two shared tables through the real daemon on the private bus: results and errors of
+each method, the difference between the two tables, and the protections against callers."""
+import os
+import sqlite3
+import subprocess
+import unittest
+
+import dbus
+
+from bus_client import FEATURE, STATUS, Segment, parse_segment, raw_call, table_proxy
+from harness import DeviceTestCase, wait_for
+
+IMPROPER = "Improper Values Provided"
+NOBODY = ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"]
+
+
+class BusServiceTest(DeviceTestCase):
+
+    def setUp(self):
+        super().setUp()
+        self.dev.set_consent(True)
+        self.dev.start_daemon()
+        self.dev.wait_started()
+        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
+                                        "WHERE name LIKE '%_survey'") == [(5,)],
+                 message="the survey tables")
+        self.feature = table_proxy(self.dev, FEATURE)
+        self.status = table_proxy(self.dev, STATUS)
+
+    def table_rows(self, table, columns="app_id, feature, extra, value"):
+        try:
+            return self.dev.query(".SurveyLog.db", f"SELECT {columns} FROM {table} ORDER BY _id")
+        except sqlite3.OperationalError:
+            return None
+
+    def segment(self, size):
+        seg = Segment(size)
+        self.addCleanup(seg.close)
+        return seg
+
+    def assert_bus_error(self, call, message):
+        with self.assertRaises(dbus.DBusException) as caught:
+            call()
+        self.assertEqual(caught.exception.get_dbus_message(), message)
+
+    def test_insert_update_delete_results_and_the_two_tables_differences(self):
+        first = self.feature.Insert({"app_id": "x", "feature": "F", "value": "1"})
+        second = self.feature.Insert({"app_id": "y", "feature": "F", "value": "2"})
+        self.assertEqual(second, first + 1)
+        self.assertEqual(self.table_rows(FEATURE), [("x", "F", None, 1), ("y", "F", None, 2)])
+        for proxy in (self.feature, self.status):
+            with self.subTest(table=proxy.dbus_interface):
+                self.assert_bus_error(lambda: proxy.Insert({"app_id": "x"}), IMPROPER)
+                self.assert_bus_error(lambda: proxy.Insert({"feature": "F"}), IMPROPER)
+
+        # The status table keeps one row per (app_id, feature): a second insert updates it.
+        row_id = self.status.Insert({"app_id": "x", "feature": "F", "value": "1"})
+        stamp = self.table_rows(STATUS, "timestamp")[0][0]
+        self.assertEqual(self.status.Insert({"app_id": "x", "feature": "F", "value": "7"}), row_id)
+        self.assertEqual(self.table_rows(STATUS), [("x", "F", None, 7)])
+        self.assertGreaterEqual(self.table_rows(STATUS, "timestamp")[0][0], stamp)
+        # Two rows of the same pair (made by Update) make the upsert write nothing.
+        self.status.Insert({"app_id": "x", "feature": "G", "value": "2"})
+        self.assertEqual(self.status.Update({"feature": "F"}, "feature='G'"), 1)
+        self.status.Insert({"app_id": "x", "feature": "F", "value": "9"})
+        self.assertEqual(self.table_rows(STATUS, "value"), [(7,), (2,)])
+
+        self.assertEqual(self.feature.Update({"extra": "e"}, "app_id='x'"), 1)
+        self.assertEqual(self.table_rows(FEATURE)[0], ("x", "F", "e", 1))
+        self.assert_bus_error(lambda: self.feature.Update({"extra": "e"}, ""), "Update API Failed")
+        self.assert_bus_error(lambda: self.status.Update({"extra": "e"}, ""), IMPROPER)
+
+        self.assert_bus_error(lambda: self.feature.Delete(""), IMPROPER)
+        self.assert_bus_error(lambda: self.feature.Delete("no such ((("), "Delete API Failed")
+        self.assertEqual(self.status.Delete("app_id='nobody'"), 0)
+        self.assertEqual(self.status.Delete(""), 0)
+        self.assertEqual(self.status.Delete("no such((("), 0)
+        self.assertEqual(self.feature.Delete("app_id='y'"), 1)
+        self.assertEqual(self.status.Delete("app_id='x'"), 2)
+        self.assertEqual(self.table_rows(FEATURE), [("x", "F", "e", 1)])
+
+    def test_select_writes_every_row_into_an_owned_segment_large_enough(self):
+        self.feature.Insert({"app_id": "x", "feature": "F", "value": "1"})
+        self.feature.Insert({"app_id": "y", "feature": "F", "value": "2"})
+        seg = self.segment(64)
+        # where and order are ignored: both rows come back in table order.
+        self.feature.Select("app_id,value", "app_id='y'", "value DESC", dbus.UInt32(seg.id))
+        self.assertEqual(seg.read()[:11], b"x,1,\0y,2,\0&")
+
+        # Exactly the result's size is enough; one byte less is refused without a write.
+        exact, short = self.segment(11), self.segment(10)
+        self.feature.Select("app_id,value", "", "", dbus.UInt32(exact.id))
+        self.assertEqual(parse_segment(exact.read()), ["x,1,", "y,2,"])
+        with self.assertRaises(dbus.DBusException):
+            self.feature.Select("app_id,value", "", "", dbus.UInt32(short.id))
+        self.assertEqual(short.read(), bytes(10))
+        # A one-byte segment holds the end mark of an empty result, nothing more.
+        one = self.segment(1)
+        with self.assertRaises(dbus.DBusException):
+            self.feature.Select("app_id", "", "", dbus.UInt32(one.id))
+        self.assertEqual(one.read(), b"\0")
+        self.status.Select("app_id", "", "", dbus.UInt32(one.id))
+        self.assertEqual(one.read(), b"&")
+
+        # An unknown segment: false, and no error of the table's domain.
+        with self.assertRaises(dbus.DBusException) as caught:
+            self.feature.Select("app_id", "", "", dbus.UInt32(0x7ffffff0))
+        self.assertNotIn("Improper", caught.exception.get_dbus_message())
+
+        # Another user's segment is never written, whatever its size.
+        made = subprocess.run(NOBODY + ["/usr/bin/python3", "-c",
+                                        "import ctypes; print(ctypes.CDLL(None).shmget"
+                                        "(0, 4096, 0o1666))"],
+                              capture_output=True, text=True, check=True)
+        foreign = Segment(4096, int(made.stdout))
+        self.addCleanup(foreign.close)
+        with self.assertRaises(dbus.DBusException):
+            self.feature.Select("app_id", "", "", dbus.UInt32(foreign.id))
+        self.assertEqual(foreign.read(), bytes(4096))
+
+    def other_tables(self):
+        """Everything the attacks must not reach: schema, every table but the attacked one,
+        the preference store."""
+        survey = self.dev.query(".SurveyLog.db", "SELECT type, name, sql FROM sqlite_master "
+                                "ORDER BY name")
+        content = {}
+        for (name,) in self.dev.query(".SurveyLog.db", "SELECT name FROM sqlite_master WHERE "
+                                      "type='table' AND name NOT IN (?, 'sqlite_sequence')",
+                                      (FEATURE,)):
+            content[name] = self.dev.query(".SurveyLog.db", f"SELECT * FROM {name}")
+        pragma = self.dev.query(".SurveyLog.db", "PRAGMA user_version")
+        pref = self.dev.query(".pref.db", "SELECT * FROM pref")
+        return survey, content, pragma, pref, os.listdir(self.dev.path("/opt/usr/dbspace"))
+
+    def test_attacks_leave_other_tables_unchanged_and_the_daemon_answering(self):
+        con = sqlite3.connect(self.dev.db_path(".SurveyLog.db"), timeout=5)
+        con.execute("INSERT INTO use_app_survey(app_id, duration) VALUES ('victim', 5)")
+        con.commit()
+        con.close()
+        self.feature.Insert({"app_id": "x", "feature": "F", "value": "1"})
+        before = self.other_tables()
+        big = "v" * 100 * 1024
+        attacks = [
+            ("drop through delete", lambda: self.feature.Delete("1=1; DROP TABLE use_app_survey"),
+             "Delete API Failed"),
+            ("drop through status delete",
+             lambda: self.status.Delete("0; DROP TABLE use_app_survey"), 0),
+            ("attach", lambda: self.feature.Delete(
+                "0; ATTACH DATABASE '" + self.dev.path("/opt/usr/dbspace/x.db") + "' AS x"),
+             "Delete API Failed"),
+            ("pragma", lambda: self.feature.Delete("0; PRAGMA user_version=7"),
+             "Delete API Failed"),
+            ("read other table in where", lambda: self.feature.Update(
+                {"extra": "e"}, "app_id IN (SELECT app_id FROM use_app_survey)"),
+             "Update API Failed"),
+            ("write other table after update", lambda: self.feature.Update(
+                {"extra": "e"}, "0; DELETE FROM use_app_survey"), "Update API Failed"),
+            ("quote in a value", lambda: self.feature.Insert(
+                {"app_id": "x', 'y'); DROP TABLE use_app_survey; --", "feature": "F"}),
+             IMPROPER),
+            ("quote in an update value", lambda: self.status.Update(
+                {"extra": "'||(SELECT app_id FROM use_app_survey)||'"}, "1"), IMPROPER),
+            ("undeclared key", lambda: self.feature.Insert(
+                {"app_id": "x", "feature": "F", "(SELECT 1)": "1"}), IMPROPER),
+            ("automatic column", lambda: self.feature.Insert(
+                {"app_id": "x", "feature": "F", "timestamp": "1"}), IMPROPER),
+            ("100 KB insert", lambda: self.feature.Insert({"app_id": big, "feature": "F"}),
+             IMPROPER),
+            ("100 KB upsert", lambda: self.status.Insert({"app_id": big, "feature": "F"}),
+             IMPROPER),
+            ("100 KB update", lambda: self.feature.Update({"extra": big}, "1"),
+             "Update API Failed"),
+            ("100 KB where", lambda: self.feature.Delete("1 OR " + big), "Delete API Failed"),
+            ("row_data of integers", lambda: raw_call(
+                self.dev, FEATURE, "Insert", "a{si}", {"app_id": 1, "feature": 2}), None),
+            ("shm id as text", lambda: raw_call(
+                self.dev, FEATURE, "Select", "ssss", "app_id", "", "", "1"), None),
+            ("where as number", lambda: raw_call(self.dev, STATUS, "Delete", "i", 1), None),
+            ("missing argument", lambda: raw_call(self.dev, FEATURE, "Update", "a{ss}",
+                                                  {"extra": "e"}), None),
+        ]
+        for name, call, expected in attacks:
+            with self.subTest(attack=name):
+                if isinstance(expected, int):
+                    self.assertEqual(call(), expected)
+                else:
+                    with self.assertRaises(dbus.DBusException) as caught:
+                        call()
+                    if expected is not None:
+                        self.assertEqual(caught.exception.get_dbus_message(), expected)
+                self.assertEqual(self.other_tables(), before)
+                self.assertGreater(self.feature.Insert({"app_id": "ok", "feature": "F"}), 0)
+
+        # Select's columns may not reach another table either; nothing is written.
+        for columns in ("(SELECT pref_data FROM pref)", "(SELECT app_id FROM use_app_survey)",
+                        "(SELECT sql FROM sqlite_master)", "randomblob(1000000)", big):
+            with self.subTest(columns=columns[:40]):
+                seg = self.segment(1 << 16)
+                self.feature.Select(columns, "", "", dbus.UInt32(seg.id))
+                self.assertEqual(seg.read(), bytes(1 << 16))
+        self.assertEqual(self.other_tables(), before)
+        self.assertEqual(self.dev.daemon.poll(), None)
+
+
+if __name__ == "__main__":
+    unittest.main()

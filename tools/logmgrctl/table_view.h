@@ -1,0 +1,12 @@
+// Read-only views of the daemon's databases under the sysroot: `show TABLE` and `queue`.
+#ifndef LOGMGR_TOOLS_LOGMGRCTL_TABLE_VIEW_H_
+#define LOGMGR_TOOLS_LOGMGRCTL_TABLE_VIEW_H_
+
+// Prints the newest |limit| rows of |table| (oldest first) with a header line, tab-separated.
+// Returns the exit code: 0, 2 for an unknown table, 3 when the database cannot be read.
+int ShowTable(const char* table, long limit);
+
+// The upload queue: its record count, then the newest |limit| records.
+int ShowQueue(long limit);
+
+#endif  // LOGMGR_TOOLS_LOGMGRCTL_TABLE_VIEW_H_
