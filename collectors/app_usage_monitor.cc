@@ -1,9 +1,176 @@
-// Seam: filled in by the app usage collector.
 #include "collectors/app_usage_monitor.h"
+
+#include <Ecore.h>
+#include <Ecore_X.h>
+#include <aul.h>
+#include <pkgmgr-info.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/time.h>
+
+#include "base_log_provider.h"
+#include "provider_registry.h"
 
 namespace _CorvaneLogManager {
 
-int AppUsageMonitor::Start() { return 0; }
-void AppUsageMonitor::OnScreenState(int) {}
+namespace {
+
+// Lock screen and home screens: their foreground time is not application use.
+const char* const kExcludedPackages[] = {"com.corvane.lockscreen", "com.corvane.w-home",
+                                         "Homescreen", "com.corvane.homescreen"};
+
+const int64_t kMinDeathPeriodMs = 150;
+const int64_t kMaxPeriodMs = 604799999;  // just under seven days
+
+int64_t SystemNowMs() {
+  struct timeval tv;
+  gettimeofday(&tv, nullptr);
+  return static_cast<int64_t>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
+}
+
+// One monitor per process, so these live beside it rather than in it.
+Ecore_Event_Handler* g_propertyEventHandler = nullptr;
+int64_t g_periodStart = 0;
+AppUsageMonitor::Clock g_clock = SystemNowMs;
+
+bool IsExcluded(const std::string& packageId) {
+  if (packageId.empty()) return true;
+  for (const char* excluded : kExcludedPackages)
+    if (packageId == excluded) return true;
+  return false;
+}
+
+std::string PackageOfApp(const char* appId) {
+  std::string packageId;
+  pkgmgrinfo_appinfo_h info = nullptr;
+  if (pkgmgrinfo_appinfo_get_appinfo(appId, &info) != PMINFO_R_OK) return packageId;
+  char* pkgid = nullptr;
+  if (pkgmgrinfo_appinfo_get_pkgid(info, &pkgid) == PMINFO_R_OK && pkgid != nullptr)
+    packageId = pkgid;
+  (void)pkgmgrinfo_appinfo_destroy_appinfo(info);
+  return packageId;
+}
+
+// Starts watching the root window's properties once; an X connection is needed for it.
+int InstallPropertyHandler(void* monitor) {
+  if (g_propertyEventHandler != nullptr) return 0;
+  if (ecore_x_init(nullptr) == 0) return -1;  // no display: windows cannot be followed
+  Ecore_X_Window root = ecore_x_window_root_first_get();
+  ecore_x_event_mask_set(root, ECORE_X_EVENT_MASK_WINDOW_PROPERTY);
+  g_propertyEventHandler = ecore_event_handler_add(ECORE_X_EVENT_WINDOW_PROPERTY,
+                                                   &AppUsageMonitor::PropertyHandler, monitor);
+  return g_propertyEventHandler != nullptr ? 0 : -1;
+}
+
+}  // namespace
+
+AppUsageMonitor::AppUsageMonitor() : currentPid(-1) {}
+
+AppUsageMonitor::~AppUsageMonitor() {
+  if (g_propertyEventHandler != nullptr) {
+    (void)ecore_event_handler_del(g_propertyEventHandler);
+    g_propertyEventHandler = nullptr;
+  }
+}
+
+void AppUsageMonitor::SetClock(Clock clock) { g_clock = clock != nullptr ? clock : SystemNowMs; }
+
+int AppUsageMonitor::Start() {
+  if (aul_listen_app_launch_signal(LaunchHandler, this) != AUL_R_OK) return -1;
+  if (aul_listen_app_dead_signal(DeadHandler, this) != AUL_R_OK) return -1;
+  return 0;
+}
+
+void AppUsageMonitor::Track(int32_t pid, const std::string& packageId) {
+  (void)tracked.emplace(pid, packageId);  // an entry already there is kept
+}
+
+int AppUsageMonitor::LaunchHandler(int pid, void* data) {
+  char appId[512];
+  memset(appId, 0, sizeof(appId));
+  if (aul_app_get_appid_bypid(pid, appId, sizeof(appId)) != AUL_R_OK) return -1;
+  if (InstallPropertyHandler(data) != 0) return -1;
+  std::string packageId = PackageOfApp(appId);
+  if (IsExcluded(packageId)) return 0;
+  AppUsageMonitor* monitor = static_cast<AppUsageMonitor*>(data);
+  if (monitor == nullptr) return -1;
+  monitor->Track(pid, packageId);
+  return 0;
+}
+
+int AppUsageMonitor::DeadHandler(int pid, void* data) {
+  AppUsageMonitor* monitor = static_cast<AppUsageMonitor*>(data);
+  if (monitor == nullptr) return -1;
+  // Any tracked process, foreground or not, closes with the time since the period began.
+  if (g_periodStart >= 1 && g_clock() - g_periodStart >= kMinDeathPeriodMs &&
+      monitor->tracked.count(pid) != 0)
+    (void)monitor->Record(pid);
+  monitor->tracked.erase(pid);
+  return 0;
+}
+
+unsigned char AppUsageMonitor::PropertyHandler(void* data, int, void* event) {
+  AppUsageMonitor* monitor = static_cast<AppUsageMonitor*>(data);
+  Ecore_X_Event_Window_Property* property = static_cast<Ecore_X_Event_Window_Property*>(event);
+  if (monitor == nullptr || property == nullptr ||
+      property->atom != ecore_x_atom_get("_NET_ACTIVE_WINDOW"))
+    return ECORE_CALLBACK_PASS_ON;
+  Ecore_X_Window active = 0;
+  if (ecore_x_window_prop_window_get(property->win, property->atom, &active, 1) == -1)
+    return ECORE_CALLBACK_PASS_ON;
+  int pid = 0;
+  if (!ecore_x_netwm_pid_get(active, &pid)) return ECORE_CALLBACK_PASS_ON;
+  char* name = nullptr;
+  (void)ecore_x_netwm_name_get(active, &name);
+  if (name == nullptr) return ECORE_CALLBACK_PASS_ON;
+  monitor->OnActiveWindow(pid, name);
+  free(name);
+  return ECORE_CALLBACK_PASS_ON;
+}
+
+void AppUsageMonitor::OnActiveWindow(int32_t pid, const char* name) {
+  char appId[512];
+  memset(appId, 0, sizeof(appId));
+  // A window of no application (a system popup) leaves the running period alone on purpose.
+  if (aul_app_get_appid_bypid(pid, appId, sizeof(appId)) != AUL_R_OK) return;
+  std::string packageId = PackageOfApp(appId);
+  if (!IsExcluded(packageId)) Track(pid, packageId);
+  if (currentPid != pid && currentPid != -2) {
+    if (tracked.count(currentPid) != 0) (void)Record(currentPid);
+    g_periodStart = tracked.count(pid) != 0 ? g_clock() : -1;
+  }
+  currentName = name;
+  currentPid = pid;
+}
+
+void AppUsageMonitor::OnScreenState(int on) {
+  if (on == 0) {
+    if (tracked.count(currentPid) != 0) (void)Record(currentPid);
+    currentPid = -2;
+    return;
+  }
+  g_periodStart = g_clock();
+  if (ecore_x_init(nullptr) == 0) return;
+  int pid = 0;
+  if (!ecore_x_netwm_pid_get(ecore_x_window_focus_get(), &pid)) return;
+  currentPid = pid;
+  (void)LaunchHandler(pid, this);
+}
+
+int AppUsageMonitor::Record(int32_t pid) {
+  BaseLogProvider* provider = ProviderRegistry::GetInstance() != nullptr
+                                  ? ProviderRegistry::GetInstance()->Lookup("use_app_survey")
+                                  : nullptr;
+  if (provider == nullptr) return -1;
+  // A period of -1 (untracked foreground) lands far above the bound and is dropped here.
+  int64_t duration = g_clock() - g_periodStart;
+  if (duration < 1 || duration > kMaxPeriodMs) return -1;
+  char values[512];
+  memset(values, 0, sizeof(values));
+  (void)snprintf(values, sizeof(values), "'%s',%lld", tracked[pid].c_str(),
+                 static_cast<long long>(duration));
+  return provider->InsertRow("app_id,duration", values);
+}
 
 }  // namespace _CorvaneLogManager

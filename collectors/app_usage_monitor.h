@@ -2,12 +2,42 @@
 #ifndef LOGMGR_COLLECTORS_APP_USAGE_MONITOR_H_
 #define LOGMGR_COLLECTORS_APP_USAGE_MONITOR_H_
 
+#include <stdint.h>
+
+#include <map>
+#include <string>
+
 namespace _CorvaneLogManager {
 
 class AppUsageMonitor {
  public:
+  AppUsageMonitor();
+  // Removes the window property handler; the aul listeners stay until the process ends.
+  ~AppUsageMonitor();
+
   int Start();
+  // 0: the screen went off, 1: it came on.
   void OnScreenState(int on);
+
+  // Platform handlers.
+  static int LaunchHandler(int pid, void* monitor);
+  static int DeadHandler(int pid, void* monitor);
+  static unsigned char PropertyHandler(void* monitor, int eventType, void* event);
+
+  // The active window changed to one of |pid| named |name| (steps after the X reads).
+  void OnActiveWindow(int32_t pid, const char* name);
+
+  // Milliseconds since the epoch; replaceable so the period rules can be checked without waiting.
+  using Clock = int64_t (*)();
+  static void SetClock(Clock clock);
+
+ private:
+  void Track(int32_t pid, const std::string& packageId);
+  int Record(int32_t pid);
+
+  std::map<int32_t, std::string> tracked;
+  std::string currentName;
+  int32_t currentPid;
 };
 
 }  // namespace _CorvaneLogManager

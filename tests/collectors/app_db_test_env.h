@@ -1,0 +1,116 @@
+// Fixture of the app collector tests: a temp sysroot with the survey database open through the
+// real registry, an app database, and real processes running copies of a small program.
+#ifndef LOGMGR_TESTS_COLLECTORS_APP_DB_TEST_ENV_H_
+#define LOGMGR_TESTS_COLLECTORS_APP_DB_TEST_ENV_H_
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sqlite3.h>
+#include <stdlib.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <string>
+#include <vector>
+
+#include "provider_registry.h"
+#include "storage/db_manager.h"
+
+namespace _CorvaneLogManager {
+
+class AppDbTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    char tmpl[] = "/tmp/logmgr-apps-XXXXXX";
+    ASSERT_NE(mkdtemp(tmpl), nullptr);
+    sysroot = tmpl;
+    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
+    unsetenv("DISPLAY");  // window tracking needs X; these tests drive the monitors directly
+    setenv("ECORE_NO_SYSTEM_MODULES", "1", 1);  // they would look for a system bus
+    ASSERT_EQ(
+        Sh("mkdir -p '" + sysroot + "/opt/usr/dbspace' '" + sysroot + "/opt/dbspace' '" + sysroot +
+           "/opt/etc' && ln -s /usr/share/zoneinfo/UTC '" + sysroot + "/opt/etc/localtime'"),
+        0);
+    ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
+    ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
+    ASSERT_EQ(AppDb("CREATE TABLE package_app_info(app_id TEXT PRIMARY KEY, package TEXT NOT NULL,"
+                    " app_exec TEXT NOT NULL)"),
+              SQLITE_OK);
+  }
+  void TearDown() override {
+    for (pid_t pid : children) {
+      kill(pid, SIGKILL);
+      waitpid(pid, nullptr, 0);
+    }
+    ProviderRegistry::Release();
+    DbManager::CloseInstance();
+    unsetenv("LOGMGR_SYSROOT");
+    (void)Sh("rm -rf '" + sysroot + "'");
+  }
+
+  static int Sh(const std::string& cmd) { return system(cmd.c_str()); }
+
+  int AppDb(const std::string& sql) {
+    sqlite3* db = nullptr;
+    int rc = sqlite3_open((sysroot + "/opt/dbspace/.pkgmgr_parser.db").c_str(), &db);
+    if (rc == SQLITE_OK) rc = sqlite3_exec(db, sql.c_str(), nullptr, nullptr, nullptr);
+    sqlite3_close(db);
+    return rc;
+  }
+
+  // Installs |appId| with a copy of sleep at |exec| (a device path).
+  void Install(const std::string& appId, const std::string& package, const std::string& exec) {
+    std::string file = sysroot + exec;
+    ASSERT_EQ(Sh("mkdir -p \"$(dirname '" + file + "')\" && cp -n /usr/bin/sleep '" + file + "'"),
+              0);
+    ASSERT_EQ(AppDb("INSERT INTO package_app_info VALUES ('" + appId + "','" + package + "','" +
+                    exec + "')"),
+              SQLITE_OK);
+  }
+
+  // Starts the executable at device path |exec|; returns once the exec has happened.
+  pid_t Run(const std::string& exec) {
+    std::string file = sysroot + exec;
+    int fds[2];
+    if (pipe2(fds, O_CLOEXEC) != 0) return -1;
+    pid_t pid = fork();
+    if (pid == 0) {
+      execl(file.c_str(), file.c_str(), "infinity", static_cast<char*>(nullptr));
+      _exit(127);
+    }
+    close(fds[1]);
+    char c;
+    (void)read(fds[0], &c, 1);  // end of file: the exec closed the pipe
+    close(fds[0]);
+    children.push_back(pid);
+    return pid;
+  }
+
+  // Rows of |sql| on the survey database, columns joined by ':' and rows ended by ';'.
+  std::string Rows(const std::string& sql) {
+    sqlite3* db = nullptr;
+    sqlite3_open_v2((sysroot + "/opt/usr/dbspace/.SurveyLog.db").c_str(), &db, SQLITE_OPEN_READONLY,
+                    nullptr);
+    sqlite3_stmt* stmt = nullptr;
+    std::string out;
+    if (sqlite3_prepare_v2(db, sql.c_str(), -1, &stmt, nullptr) != SQLITE_OK) out = "<error>";
+    while (stmt != nullptr && sqlite3_step(stmt) == SQLITE_ROW) {
+      for (int i = 0; i < sqlite3_column_count(stmt); ++i) {
+        const unsigned char* text = sqlite3_column_text(stmt, i);
+        out += (i > 0 ? ":" : "") + std::string(text ? reinterpret_cast<const char*>(text) : "");
+      }
+      out += ";";
+    }
+    sqlite3_finalize(stmt);
+    sqlite3_close(db);
+    return out;
+  }
+
+  std::string sysroot;
+  std::vector<pid_t> children;
+};
+
+}  // namespace _CorvaneLogManager
+
+#endif  // LOGMGR_TESTS_COLLECTORS_APP_DB_TEST_ENV_H_

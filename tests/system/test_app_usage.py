@@ -1,0 +1,151 @@
+"""Foreground periods through the real daemon: real app processes, real X windows (Xvfb)."""
+import os
+import time
+import unittest
+
+from harness import DBSPACE, DeviceTestCase, wait_for
+
+FAKETIME_LIB = "/usr/lib/x86_64-linux-gnu/faketime/libfaketime.so.1"
+
+ALPHA, BETA, GAMMA, LOCK = "com.ex.alpha", "com.ex.beta", "com.ex.gamma", "com.corvane.lockscreen"
+PACKAGES = {ALPHA: "pkg.alpha", BETA: "pkg.beta", LOCK: LOCK}
+AUL = ("/aul/dbus_handler", "org.tizen.aul.signal")
+
+
+class MsClock:
+    """The daemon's wall clock, standing still until the test advances it (in milliseconds)."""
+
+    def __init__(self, dev, start_ms=1773136800000):
+        self.path = os.path.join(dev.sysroot, "faketime")
+        self.now_ms = start_ms
+        self._write()
+        self.env = {"LD_PRELOAD": FAKETIME_LIB, "FAKETIME_TIMESTAMP_FILE": self.path,
+                    "FAKETIME_NO_CACHE": "1", "FAKETIME_DONT_FAKE_MONOTONIC": "1"}
+
+    def _write(self):
+        stamp = time.strftime("%Y-%m-%d %H:%M:%S", time.localtime(self.now_ms // 1000))
+        with open(self.path + ".tmp", "w") as f:
+            f.write(f"{stamp}.{self.now_ms % 1000:03d}\n")
+        os.replace(self.path + ".tmp", self.path)
+
+    def advance_ms(self, ms):
+        self.now_ms += ms
+        self._write()
+
+
+class AppCase(DeviceTestCase):
+    WITH_X = True
+    FROZEN = False  # the daemon's wall clock stands still until the test advances it
+
+    def setUp(self):
+        super().setUp()
+        self.pids = {}
+        for app, package in PACKAGES.items():
+            self.dev.devsim("app", "install", app, "--package", package)
+        os.makedirs(self.dev.path(DBSPACE), exist_ok=True)
+        self.dev.set_consent(True)
+        self.clock = MsClock(self.dev) if self.FROZEN else None
+        self.dev.start_daemon(extra_env=self.clock.env if self.clock else None)
+        for app in PACKAGES:
+            self.pids[app] = int(self.dev.devsim("app", "launch", app).stdout)
+            self.addCleanup(self.dev.devsim, "app", "kill", app, check=False)
+
+        # Launches count once the daemon listens, and the first one counted makes it watch the
+        # root window: announce them again until it does.
+        def launched():
+            for pid in self.pids.values():
+                self.aul("app_launch", f"uint32:{pid}")
+            return self.root_watched()
+        wait_for(launched, timeout=30, interval=0.2, message="the daemon to watch the root window")
+
+    def root_watched(self):
+        from Xlib import X, display
+        os.environ["DISPLAY"] = self.dev.env["DISPLAY"]
+        d = display.Display()
+        try:
+            return d.screen().root.get_attributes().all_event_masks & X.PropertyChangeMask
+        finally:
+            d.close()
+
+    def focus(self, app, *extra):
+        self.dev.devsim("app", "focus", app, *extra)
+        return time.monotonic()
+
+    def periods(self, package=None):
+        rows = self.dev.query(".SurveyLog.db",
+                              "SELECT app_id, duration FROM use_app_survey ORDER BY _id")
+        return [r for r in rows if package is None or r[0] == package]
+
+    def aul(self, member, *args):
+        self.dev.dbus_send("--type=signal", AUL[0], f"{AUL[1]}.{member}", *args)
+
+
+class AppUsageTest(AppCase):
+
+    def test_five_seconds_in_front_make_one_row_of_about_5000_ms(self):
+        self.focus(BETA)
+        started = self.focus(ALPHA)
+        time.sleep(5)  # the period being measured
+        ended = self.focus(BETA)
+        rows = wait_for(lambda: self.periods("pkg.alpha"), message="alpha's period")
+        self.assertEqual(len(rows), 1)
+        self.assertGreaterEqual(rows[0][1], 5000)
+        # What the test saw between its two activations, give or take one tool start.
+        self.assertAlmostEqual(rows[0][1], (ended - started) * 1000, delta=500)
+
+    def test_lock_screen_ends_the_period_and_starts_none(self):
+        self.focus(ALPHA)
+        self.focus(LOCK)
+        wait_for(lambda: self.periods("pkg.alpha"), message="alpha's period")
+        self.focus(BETA)
+        self.focus(ALPHA)
+        wait_for(lambda: self.periods("pkg.beta"), message="beta's period")
+        self.assertEqual([r[0] for r in self.periods()], ["pkg.alpha", "pkg.beta"])
+
+    def test_bad_input_is_skipped_and_later_events_still_count(self):
+        self.focus(BETA)
+        self.aul("app_launch", "string:123")
+        self.aul("app_dead", "int32:5")
+        self.aul("app_launch", "uint32:4000000")  # no such process
+        self.aul("app_launch", f"uint32:{os.getpid()}")  # a process of no app
+        self.aul("app_dead", f"uint32:{os.getpid()}")
+        self.focus(ALPHA, "--no-pid")  # a window of no process: beta's period runs on
+        self.focus(ALPHA)
+        self.focus(BETA)
+        wait_for(lambda: len(self.periods()) == 2, message="two periods")
+        self.assertEqual([r[0] for r in self.periods()], ["pkg.beta", "pkg.alpha"])
+        self.assertIsNone(self.dev.daemon.poll())
+
+
+class DeathRuleTest(AppCase):
+    FROZEN = True
+
+    def in_front_at_known_time(self, app):
+        """Brings gamma to the front and then |app|, until the daemon shows it took both in
+        step with the clock (gamma's row of exactly 1000 ms); |app|'s period then starts now."""
+        def probe():
+            self.focus(GAMMA)
+            self.clock.advance_ms(1000)
+            self.focus(app)
+            try:
+                return wait_for(lambda: (GAMMA, 1000) in self.periods(), timeout=2)
+            except AssertionError:
+                return False
+        wait_for(probe, timeout=60, interval=0, message="the daemon to follow the windows")
+
+    def test_deaths_count_only_from_150_ms_into_a_period(self):
+        self.dev.devsim("app", "install", GAMMA)
+        self.dev.devsim("app", "launch", GAMMA)
+        self.addCleanup(self.dev.devsim, "app", "kill", GAMMA, check=False)
+        self.in_front_at_known_time(ALPHA)
+        self.clock.advance_ms(149)
+        self.dev.devsim("app", "kill", GAMMA)
+        self.clock.advance_ms(1851)
+        self.dev.devsim("app", "kill", BETA)  # in the background, still counted
+        wait_for(lambda: self.periods("pkg.beta"), message="beta's row")
+        self.assertEqual(self.periods(GAMMA), [(GAMMA, 1000)])
+        self.assertEqual(self.periods("pkg.beta"), [("pkg.beta", 2000)])
+
+
+if __name__ == "__main__":
+    unittest.main()
