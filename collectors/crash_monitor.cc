@@ -1,9 +1,103 @@
-// Seam: filled in by its collector.
 #include "collectors/crash_monitor.h"
+
+#include <dbus/dbus-glib-lowlevel.h>
+#include <glib.h>
+#include <pkgmgr-info.h>
+#include <stdint.h>
+#include <stdio.h>
+#include <string.h>
+
+#include "base_log_provider.h"
+#include "provider_registry.h"
 
 namespace _CorvaneLogManager {
 
-int CrashMonitor::Start() { return 0; }
-int CrashMonitor::Stop() { return 0; }
+namespace {
+
+const char kCrashInterface[] = "org.tizen.system.crash.Crash";
+const char kCrashRule[] = "type='signal',interface='org.tizen.system.crash.Crash'";
+// The only kind of application error written here.
+const int kErrorTypeCrash = 1;
+
+int RecordApp(const pkgmgrinfo_appinfo_h handle, void* userData) {
+  char* appId = nullptr;
+  (void)pkgmgrinfo_appinfo_get_appid(handle, &appId);
+  ProviderRegistry* registry = ProviderRegistry::GetInstance();
+  BaseLogProvider* provider =
+      registry != nullptr ? registry->Lookup("report_app_error_survey") : nullptr;
+  if (provider != nullptr && appId != nullptr) {
+    char values[512];
+    memset(values, 0, sizeof(values));
+    (void)snprintf(values, sizeof(values), "'%s',%d", appId,
+                   static_cast<int>(reinterpret_cast<intptr_t>(userData)));
+    (void)provider->InsertRow("app_id,type", values);
+  }
+  return 0;  // every application sharing the executable gets its row
+}
+
+void RecordAppsOfExecutable(const char* exePath, int errorType) {
+  pkgmgrinfo_appinfo_filter_h filter = nullptr;
+  if (pkgmgrinfo_appinfo_filter_create(&filter) != PMINFO_R_OK) return;
+  if (pkgmgrinfo_appinfo_filter_add_string(filter, PMINFO_APPINFO_PROP_APP_EXEC, exePath) ==
+      PMINFO_R_OK)
+    (void)pkgmgrinfo_appinfo_filter_foreach_appinfo(
+        filter, RecordApp, reinterpret_cast<void*>(static_cast<intptr_t>(errorType)));
+  (void)pkgmgrinfo_appinfo_filter_destroy(filter);
+}
+
+}  // namespace
+
+int CrashMonitor::Start() {
+  DBusError err;
+  dbus_error_init(&err);
+  DBusConnection* connection = dbus_bus_get(DBUS_BUS_SYSTEM, &err);
+  if (dbus_error_is_set(&err)) {
+    g_print("Cannot get System BUS connection: %s\n", err.message);
+    dbus_error_free(&err);
+    return -1;
+  }
+  dbus_connection_setup_with_g_main(connection, nullptr);
+  dbus_bus_add_match(connection, kCrashRule, &err);
+  if (dbus_error_is_set(&err)) {
+    dbus_error_free(&err);
+    return -1;
+  }
+  return dbus_connection_add_filter(connection, CrashFilter, this, nullptr) ? 0 : -1;
+}
+
+int CrashMonitor::Stop() {
+  DBusError err;
+  dbus_error_init(&err);
+  DBusConnection* connection = dbus_bus_get(DBUS_BUS_SYSTEM, &err);
+  if (dbus_error_is_set(&err)) {
+    dbus_error_free(&err);
+    return 0;
+  }
+  dbus_bus_remove_match(connection, kCrashRule, &err);
+  if (dbus_error_is_set(&err)) {
+    dbus_error_free(&err);
+  } else {
+    dbus_connection_remove_filter(connection, CrashFilter, this);
+  }
+  dbus_connection_unref(connection);
+  return 0;
+}
+
+DBusHandlerResult CrashMonitor::CrashFilter(DBusConnection*, DBusMessage* message, void*) {
+  if (!dbus_message_is_signal(message, kCrashInterface, "ProcessCrashed"))
+    return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+  DBusError err;
+  dbus_error_init(&err);
+  const char* processName = nullptr;
+  const char* exePath = nullptr;
+  if (!dbus_message_get_args(message, &err, DBUS_TYPE_STRING, &processName, DBUS_TYPE_STRING,
+                             &exePath, DBUS_TYPE_INVALID)) {
+    dbus_error_free(&err);
+    return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+  }
+  RecordAppsOfExecutable(exePath, kErrorTypeCrash);
+  // Other filters on the shared connection still see the signal.
+  return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+}
 
 }  // namespace _CorvaneLogManager

@@ -1,6 +1,9 @@
-// CrashMonitor: application crashes as report_app_error_survey rows.
+// CrashMonitor: application crashes as report_app_error_survey rows, one per application that
+// shares the crashed executable.
 #ifndef LOGMGR_COLLECTORS_CRASH_MONITOR_H_
 #define LOGMGR_COLLECTORS_CRASH_MONITOR_H_
+
+#include <dbus/dbus.h>
 
 namespace _CorvaneLogManager {
 
@@ -8,6 +11,9 @@ class CrashMonitor {
  public:
   int Start();
   int Stop();
+
+  static DBusHandlerResult CrashFilter(DBusConnection* connection, DBusMessage* message,
+                                       void* userData);
 };
 
 }  // namespace _CorvaneLogManager

@@ -1,9 +1,74 @@
-// Seam: filled in by its collector.
 #include "collectors/package_monitor.h"
+
+#include <package-manager.h>
+#include <stdio.h>
+#include <string.h>
+
+#include "base_log_provider.h"
+#include "provider_registry.h"
 
 namespace _CorvaneLogManager {
 
-int PackageMonitor::Start() { return 0; }
-int PackageMonitor::Stop() { return 0; }
+namespace {
+
+// Install, uninstall and upgrade events.
+const int kStatusTypes = 7;
+
+}  // namespace
+
+PackageMonitor::PackageMonitor() : client(nullptr), pendingType(-1) {
+  client = pkgmgr_client_new(PC_LISTENING);
+}
+
+PackageMonitor::~PackageMonitor() { (void)Stop(); }
+
+int PackageMonitor::Start() {
+  (void)pkgmgr_client_set_status_type(client, kStatusTypes);
+  int result = pkgmgr_client_listen_status(client, StatusHandler, this);
+  if (result < 0) {
+    (void)pkgmgr_client_free(client);
+    client = nullptr;
+    return result;
+  }
+  return 0;
+}
+
+int PackageMonitor::Stop() {
+  if (client != nullptr) (void)pkgmgr_client_free(client);
+  client = nullptr;
+  return 0;
+}
+
+int PackageMonitor::StatusHandler(int, const char*, const char* packageId, const char* key,
+                                  const char* value, const void*, void* userData) {
+  PackageMonitor* monitor = static_cast<PackageMonitor*>(userData);
+  if (monitor == nullptr) return -1;
+  if (key == nullptr || value == nullptr) return 0;
+  if (strcmp(key, "start") == 0) {
+    if (strcmp(value, "install") == 0) {
+      monitor->pendingType = 0;
+    } else if (strcmp(value, "uninstall") == 0) {
+      monitor->pendingType = 1;
+    } else if (strcmp(value, "update") == 0) {
+      monitor->pendingType = 2;
+    }
+  }
+  // A failed "end" deliberately keeps the kind pending: a later successful end records it.
+  if (strcmp(key, "end") == 0 && strcmp(value, "ok") == 0 && monitor->pendingType != -1) {
+    (void)monitor->Record(packageId != nullptr ? packageId : "");
+    monitor->pendingType = -1;
+  }
+  return 0;
+}
+
+int PackageMonitor::Record(const char* packageId) {
+  ProviderRegistry* registry = ProviderRegistry::GetInstance();
+  BaseLogProvider* provider = registry != nullptr ? registry->Lookup("manage_app_survey") : nullptr;
+  if (provider == nullptr) return -1;
+  // A long package id is cut to fit, type and all; the row is still written.
+  char values[132];
+  (void)snprintf(values, sizeof(values), "'%s',%d", packageId, pendingType);
+  return provider->InsertRow("installed_app_id,type", values) != 0 ? -1 : 0;
+}
 
 }  // namespace _CorvaneLogManager

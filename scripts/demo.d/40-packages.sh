@@ -1,0 +1,27 @@
+# Packages and crashes: an install, an update that fails and then succeeds, a crash.
+survey() { sqlite3 -cmd ".timeout 5000" "$SYSROOT/opt/usr/dbspace/.SurveyLog.db" "$1" 2>/dev/null || true; }
+pkg_rows() { survey "SELECT count(*) FROM manage_app_survey"; }
+show_table() {
+  local table="$1" columns="$2" legend="$3"
+  if logmgrctl show "$table" >/dev/null 2>&1; then
+    logmgrctl show "$table" | while read -r row; do info "$row"; done
+  else
+    survey "SELECT $columns FROM $table ORDER BY _id" | while read -r row; do
+      info "$row  ($legend)"; done
+  fi
+}
+
+step "A watch face is installed; an update of it fails, then the package manager finishes it"
+devsim pkg install com.example.watchface
+devsim pkg update com.example.watchface --fail
+info "the failed update leaves its kind pending: nothing recorded yet"
+# The package manager completes the pending update without announcing a new start.
+dbus-send --system --type=signal /org/tizen/pkgmgr_status org.tizen.pkgmgr_status.status \
+  string:retry string:tpk string:com.example.watchface string:end string:ok
+wait_until '[ "$(pkg_rows)" -ge 2 ]'
+show_table manage_app_survey "installed_app_id, type" "package|0 install, 1 uninstall, 2 update"
+
+step "The watch face crashes"
+devsim crash com.example.watchface
+wait_until '[ "$(survey "SELECT count(*) FROM report_app_error_survey")" -ge 1 ]'
+show_table report_app_error_survey "app_id, type" "app|1 crash"
