@@ -108,8 +108,10 @@ bool UpdateFits(const std::string& table, const BusRowLists& lists, const BusRow
   std::string columns = lists.columns + autoTexts.columns;
   std::string values = lists.values + autoTexts.values;
   if (columns.size() >= kListSize || values.size() >= kListSize) return false;
+  // The SET text is built with a trailing comma, which is dropped before the statement.
   size_t set = SetLength(columns, values);
   if (set >= kStatementSize) return false;
+  if (set > 0) --set;
   size_t statement = strlen("UPDATE  SET  WHERE ;") + table.size() + set + strlen(where);
   return statement < kStatementSize;
 }
