@@ -110,8 +110,9 @@ void BM_BarePreparedInsert(benchmark::State& state) {
     // At the limit the bare table is held there too, untimed, so both see the same size.
     if (start == kLimit && done % kBatch == 0) {
       state.PauseTiming();
-      g_conn->Exec("DELETE FROM use_app_survey WHERE _id < (SELECT MIN(_id) FROM "
-                   "use_app_survey) + 500;");
+      g_conn->Exec(
+          "DELETE FROM use_app_survey WHERE _id < (SELECT MIN(_id) FROM "
+          "use_app_survey) + 500;");
       state.ResumeTiming();
     }
   }

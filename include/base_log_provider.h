@@ -43,8 +43,8 @@ class BaseLogProvider : public IDbResponseListener {
   virtual int InsertRow(const char* columns, const char* values, int32_t* rowId = nullptr);
   virtual int UpdateRows(const char* columns, const char* values, const char* where,
                          int32_t* count = nullptr);
-  virtual int SelectRows(const char* columns, const char* where, const char* orderBy,
-                         int* rowCount, char*** rows);
+  virtual int SelectRows(const char* columns, const char* where, const char* orderBy, int* rowCount,
+                         char*** rows);
   // Note the argument order: ORDER BY before GROUP BY (the statement places GROUP BY first).
   virtual int SelectGroupedRows(const char* columns, const char* where, const char* orderBy,
                                 const char* groupBy, int* rowCount, char*** rows);

@@ -35,8 +35,8 @@ DbConnection* SurveyConnection() {
 }  // namespace
 
 int BaseLogProvider::InitTableConfig(const char* tableName, const char* columnList,
-                                     int32_t retentionDays, int32_t checkInterval,
-                                     int32_t maxRows, int32_t initialCounter) {
+                                     int32_t retentionDays, int32_t checkInterval, int32_t maxRows,
+                                     int32_t initialCounter) {
   config.tableName = tableName;
   config.retention_days = retentionDays;
   config.check_interval = checkInterval;
@@ -199,9 +199,8 @@ int BaseLogProvider::SelectRows(const char* columns, const char* where, const ch
   return SelectGroupedRows(columns, where, orderBy, nullptr, rowCount, rows);
 }
 
-int BaseLogProvider::SelectGroupedRows(const char* columns, const char* where,
-                                       const char* orderBy, const char* groupBy, int* rowCount,
-                                       char*** rows) {
+int BaseLogProvider::SelectGroupedRows(const char* columns, const char* where, const char* orderBy,
+                                       const char* groupBy, int* rowCount, char*** rows) {
   DbConnection* conn = SurveyConnection();
   if (conn == nullptr) return -1;
   char sql[kStatementSize];

@@ -12,7 +12,7 @@ namespace {
 
 ProviderRegistry* g_registry = nullptr;
 
-const char* const kKeys[] = {"use_app_survey",          "use_app_feature_survey",
+const char* const kKeys[] = {"use_app_survey",           "use_app_feature_survey",
                              "report_app_status_survey", "report_app_error_survey",
                              "manage_app_survey",        "server_upload"};
 

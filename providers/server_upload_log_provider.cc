@@ -42,8 +42,8 @@ int ServerUploadLogProvider::InsertRow(const char* columns, const char* values, 
 
 // Deliberately unlike the survey tables: timestamp is left alone and both lists are split at
 // blanks too.
-int ServerUploadLogProvider::UpdateRows(const char* columns, const char* values,
-                                        const char* where, int32_t* count) {
+int ServerUploadLogProvider::UpdateRows(const char* columns, const char* values, const char* where,
+                                        int32_t* count) {
   return UpdateOn(UploadConnection(), columns, values, where, count, false, ", ");
 }
 
@@ -68,8 +68,8 @@ int ServerUploadLogProvider::GetRowCount() {
 int ServerUploadLogProvider::DeleteOldestRows() { return DeleteOldestOn(UploadConnection()); }
 
 int ServerUploadLogProvider::SelectLimitedRows(const char* columns, const char* where,
-                                               const char* orderBy, uint32_t limit,
-                                               int* rowCount, char*** rows) {
+                                               const char* orderBy, uint32_t limit, int* rowCount,
+                                               char*** rows) {
   DbConnection* conn = UploadConnection();
   if (conn == nullptr) return -1;
   char sql[kStatementSize];

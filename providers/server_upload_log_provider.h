@@ -31,8 +31,8 @@ class ServerUploadLogProvider : public BaseLogProvider {
 
   // The only read of the queue (SelectRows would run on the survey database). "LIMIT %ld"
   // follows the ORDER BY text without a blank: that text must end with one. kNoLimit: no LIMIT.
-  int SelectLimitedRows(const char* columns, const char* where, const char* orderBy,
-                        uint32_t limit, int* rowCount, char*** rows);
+  int SelectLimitedRows(const char* columns, const char* where, const char* orderBy, uint32_t limit,
+                        int* rowCount, char*** rows);
 };
 
 }  // namespace _CorvaneLogManager

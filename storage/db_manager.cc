@@ -121,9 +121,7 @@ int UploadDbManager::Init() {
   return 0;
 }
 
-void UploadDbManager::AddListener(IDbResponseListener* listener) {
-  listeners.push_back(listener);
-}
+void UploadDbManager::AddListener(IDbResponseListener* listener) { listeners.push_back(listener); }
 
 void UploadDbManager::RemoveListener(IDbResponseListener* listener) {
   Remove(&listeners, listener);

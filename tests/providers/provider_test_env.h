@@ -6,8 +6,6 @@
 #include <gtest/gtest.h>
 #include <sqlite3.h>
 #include <stdlib.h>
-#include <string.h>
-#include <sys/stat.h>
 #include <sys/time.h>
 #include <unistd.h>
 
@@ -28,65 +26,49 @@ inline long long TestNowMs() {
 }
 
 // True if |text| is |pattern| with each '#' standing for a run of digits, collected in
-// |numbers| (a light stand-in for std::regex, which warns under the sanitizer build).
+// |numbers| (std::regex warns in the sanitizer build).
 inline bool MatchesWithNumbers(const std::string& text, const std::string& pattern,
                                std::vector<long long>* numbers = nullptr) {
   size_t t = 0;
   for (char p : pattern) {
+    size_t start = t;
     if (p != '#') {
-      if (t >= text.size() || text[t] != p) return false;
-      ++t;
+      if (t >= text.size() || text[t++] != p) return false;
       continue;
     }
-    size_t start = t;
-    while (t < text.size() && text[t] >= '0' && text[t] <= '9') ++t;
+    while (t < text.size() && isdigit(static_cast<unsigned char>(text[t]))) ++t;
     if (t == start) return false;
     if (numbers != nullptr) numbers->push_back(std::stoll(text.substr(start, t - start)));
   }
   return t == text.size();
 }
 
-class StatementTrace {
- public:
+// Statements as SQLite starts them, minus the test's own queries.
+struct StatementTrace {
   void Attach(DbConnection* conn) {
     sqlite3_trace_v2(conn->Handle(), SQLITE_TRACE_STMT, &StatementTrace::OnStatement, this);
   }
-  void Detach(DbConnection* conn) { sqlite3_trace_v2(conn->Handle(), 0, nullptr, nullptr); }
-  std::vector<std::string> Take() {
-    std::vector<std::string> out;
-    out.swap(statements);
-    return out;
-  }
-
- private:
+  std::vector<std::string> Take() { return std::move(statements); }
   static int OnStatement(unsigned, void* self, void*, void* text) {
-    const char* sql = static_cast<const char*>(text);
-    // Statements run by sqlite3_exec are reported once; trigger sub-statements start with "--".
     StatementTrace* trace = static_cast<StatementTrace*>(self);
-    if (!trace->paused && sql != nullptr && strncmp(sql, "--", 2) != 0)
-      trace->statements.push_back(sql);
+    if (!trace->paused) trace->statements.push_back(static_cast<const char*>(text));
     return 0;
   }
   std::vector<std::string> statements;
-
- public:
-  bool paused = false;  // the test's own queries
+  bool paused = false;
 };
 
 class ProviderTest : public ::testing::Test {
  protected:
-  static constexpr const char* kZone = "Europe/Berlin";
-
   void SetUp() override {
     char tmpl[] = "/tmp/logmgr-providers-XXXXXX";
     ASSERT_NE(mkdtemp(tmpl), nullptr);
     sysroot = tmpl;
     ASSERT_EQ(system(("mkdir -p " + sysroot + "/opt/usr/dbspace " + sysroot + "/opt/etc").c_str()),
               0);
-    SetLocaltimeLink(std::string("/usr/share/zoneinfo/") + kZone);
+    SetLocaltimeLink("/usr/share/zoneinfo/Europe/Berlin");
     setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
   }
-
   void TearDown() override {
     ProviderRegistry::Release();
     DbManager::CloseInstance();
@@ -94,16 +76,14 @@ class ProviderTest : public ::testing::Test {
     unsetenv("LOGMGR_SYSROOT");
     (void)system(("rm -rf " + sysroot).c_str());
   }
-
   // Empty target: no link at all.
   void SetLocaltimeLink(const std::string& target) {
     std::string link = sysroot + "/opt/etc/localtime";
     unlink(link.c_str());
     if (!target.empty()) {
-      ASSERT_EQ(symlink(target.c_str(), link.c_str()), 0);
+      EXPECT_EQ(symlink(target.c_str(), link.c_str()), 0);
     }
   }
-
   // The daemon's start order: registry first, then both files opened.
   void StartProviders() {
     ASSERT_NE(DbManager::GetInstance(), nullptr);
@@ -113,29 +93,15 @@ class ProviderTest : public ::testing::Test {
     ASSERT_EQ(UploadDbManager::GetInstance()->Init(), 0);
     survey = DbManager::GetInstance()->GetConnection();
     upload = UploadDbManager::GetInstance()->GetConnection();
-    // Speed only: the trimming tests write thousands of rows.
-    ASSERT_EQ(survey->Exec("PRAGMA synchronous=OFF;"), 0);
     surveyTrace.Attach(survey);
     uploadTrace.Attach(upload);
   }
-
   BaseLogProvider* Provider(const char* name) {
     return ProviderRegistry::GetInstance()->Lookup(name);
   }
-
-  // The test's own queries, kept out of the trace.
-  long long Scalar(DbConnection* conn, const std::string& sql) {
-    Untraced untraced(this);
-    sqlite3_stmt* stmt = nullptr;
-    long long value = -1;
-    if (sqlite3_prepare_v2(conn->Handle(), sql.c_str(), -1, &stmt, nullptr) == SQLITE_OK &&
-        sqlite3_step(stmt) == SQLITE_ROW)
-      value = sqlite3_column_int64(stmt, 0);
-    sqlite3_finalize(stmt);
-    return value;
-  }
-  std::string Text(DbConnection* conn, const std::string& sql) {
-    Untraced untraced(this);
+  // First column of the first row as text ("<none>" without a row, "<null>" for NULL).
+  std::string Query(DbConnection* conn, const std::string& sql) {
+    surveyTrace.paused = uploadTrace.paused = true;
     sqlite3_stmt* stmt = nullptr;
     std::string value = "<none>";
     if (sqlite3_prepare_v2(conn->Handle(), sql.c_str(), -1, &stmt, nullptr) == SQLITE_OK &&
@@ -144,26 +110,22 @@ class ProviderTest : public ::testing::Test {
       value = text == nullptr ? "<null>" : reinterpret_cast<const char*>(text);
     }
     sqlite3_finalize(stmt);
+    surveyTrace.paused = uploadTrace.paused = false;
     return value;
   }
-  // Fills |table| with |rows| rows directly (one transaction), untraced.
-  void Fill(const std::string& table, const std::string& columns, const std::string& values,
-            int rows) {
-    surveyTrace.Detach(survey);
-    ASSERT_EQ(survey->Exec("BEGIN;"), 0);
-    std::string sql = "INSERT INTO " + table + "(" + columns + ") VALUES (" + values + ");";
-    for (int i = 0; i < rows; ++i) ASSERT_EQ(survey->Exec(sql.c_str()), 0);
-    ASSERT_EQ(survey->Exec("COMMIT;"), 0);
-    surveyTrace.Attach(survey);
+  long long Number(DbConnection* conn, const std::string& sql) {
+    return std::stoll(Query(conn, sql));
   }
-
-  struct Untraced {
-    explicit Untraced(ProviderTest* t) : test(t) {
-      test->surveyTrace.paused = test->uploadTrace.paused = true;
-    }
-    ~Untraced() { test->surveyTrace.paused = test->uploadTrace.paused = false; }
-    ProviderTest* test;
-  };
+  // Adds |rows| copies of a row in one transaction, untraced.
+  void Fill(DbConnection* conn, const std::string& table, const std::string& columns,
+            const std::string& values, int rows) {
+    surveyTrace.paused = uploadTrace.paused = true;
+    std::string sql = "INSERT INTO " + table + "(" + columns + ") VALUES (" + values + ");";
+    ASSERT_EQ(conn->Exec("BEGIN;"), 0);
+    for (int i = 0; i < rows; ++i) ASSERT_EQ(conn->Exec(sql.c_str()), 0);
+    ASSERT_EQ(conn->Exec("COMMIT;"), 0);
+    surveyTrace.paused = uploadTrace.paused = false;
+  }
 
   std::string sysroot;
   DbConnection* survey = nullptr;
