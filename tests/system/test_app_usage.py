@@ -19,8 +19,11 @@ class MsClock:
         self.path = os.path.join(dev.sysroot, "faketime")
         self.now_ms = start_ms
         self._write()
+        asan = dev.env.get("ASAN_OPTIONS", "")
+        # A sanitizer build would refuse a preload ahead of its runtime.
         self.env = {"LD_PRELOAD": FAKETIME_LIB, "FAKETIME_TIMESTAMP_FILE": self.path,
-                    "FAKETIME_NO_CACHE": "1", "FAKETIME_DONT_FAKE_MONOTONIC": "1"}
+                    "FAKETIME_NO_CACHE": "1", "FAKETIME_DONT_FAKE_MONOTONIC": "1",
+                    "ASAN_OPTIONS": (asan + ":" if asan else "") + "verify_asan_link_order=0"}
 
     def _write(self):
         stamp = time.strftime("%Y-%m-%d %H:%M:%S", time.localtime(self.now_ms // 1000))
