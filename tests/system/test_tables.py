@@ -1,9 +1,8 @@
 """A started daemon has created every log table, exactly as declared."""
-import os
 import re
 import unittest
 
-from harness import DBSPACE, DeviceTestCase, wait_for
+from harness import DeviceTestCase, wait_for
 
 SURVEY_TABLES = {
     "use_app_survey": "CREATE TABLE IF NOT EXISTS use_app_survey(_id INTEGER PRIMARY KEY "
@@ -40,7 +39,6 @@ class TablesTest(DeviceTestCase):
                 "AND name NOT LIKE 'sqlite_%'"))
 
     def test_started_daemon_has_the_six_tables_with_their_create_texts(self):
-        os.makedirs(self.dev.path(DBSPACE), exist_ok=True)  # part of the device image
         self.dev.set_consent(True)
         self.dev.start_daemon()
         for db, expected in ((".SurveyLog.db", SURVEY_TABLES),
