@@ -11,7 +11,7 @@ constexpr int32_t kCheckInterval = 500;
 constexpr int32_t kMaxRows = 5000;
 
 // Indexed by SurveyTable. Status reports are kept 10 days, everything else 3 (deliberate).
-const SurveyTableSpec kSurveyTables[] = {
+const SurveyTableInfo kSurveyTables[] = {
     {"use_app_survey", "_id,timestamp,time_zone,app_id,duration",
      "CREATE TABLE IF NOT EXISTS use_app_survey(_id INTEGER PRIMARY KEY AUTOINCREMENT, "
      "timestamp INTEGER, time_zone TEXT, app_id TEXT, duration INTEGER );",
@@ -37,26 +37,26 @@ const SurveyTableSpec kSurveyTables[] = {
 
 }  // namespace
 
-const SurveyTableSpec& GetSurveyTableSpec(SurveyTable table) {
+const SurveyTableInfo& GetSurveyTableInfo(SurveyTable table) {
   return kSurveyTables[static_cast<int>(table)];
 }
 
-SurveyLogProvider::SurveyLogProvider(SurveyTable table) : spec(GetSurveyTableSpec(table)) {
+SurveyLogProvider::SurveyLogProvider(SurveyTable table) : info(GetSurveyTableInfo(table)) {
   DbManager* manager = DbManager::GetInstance();
   // Without the manager's connection the table stays undescribed and every operation fails;
   // deliberately never retried.
   if (manager == nullptr || manager->GetConnection() == nullptr) return;
-  (void)InitTableConfig(spec.tableName, spec.columnList, spec.retentionDays, kCheckInterval,
+  (void)InitTableConfig(info.tableName, info.columnList, info.retentionDays, kCheckInterval,
                         kMaxRows, 0);
-  if (spec.busObject) busObject = CreateProviderBusObject(spec.tableName);
+  if (info.busObject) busObject = CreateProviderBusObject(info.tableName);
 }
 
 SurveyLogProvider::~SurveyLogProvider() {
   if (busObject != nullptr) ReleaseProviderBusObject(busObject);
 }
 
-const char* SurveyLogProvider::GetCreateTableSql() { return spec.createSql; }
+const char* SurveyLogProvider::GetCreateTableSql() { return info.createSql; }
 
-const char* SurveyLogProvider::GetTableName() { return spec.tableName; }
+const char* SurveyLogProvider::GetTableName() { return info.tableName; }
 
 }  // namespace _CorvaneLogManager

@@ -11,7 +11,7 @@ namespace _CorvaneLogManager {
 
 enum class SurveyTable { kUseApp, kManageApp, kAppError, kUseAppFeature, kReportAppStatus };
 
-struct SurveyTableSpec {
+struct SurveyTableInfo {
   const char* tableName;
   const char* columnList;
   const char* createSql;
@@ -19,7 +19,7 @@ struct SurveyTableSpec {
   bool busObject;  // shared with other processes through a bus object
 };
 
-const SurveyTableSpec& GetSurveyTableSpec(SurveyTable table);
+const SurveyTableInfo& GetSurveyTableInfo(SurveyTable table);
 
 class SurveyLogProvider : public BaseLogProvider {
  public:
@@ -34,7 +34,7 @@ class SurveyLogProvider : public BaseLogProvider {
   explicit SurveyLogProvider(SurveyTable table);
 
  private:
-  const SurveyTableSpec& spec;
+  const SurveyTableInfo& info;
   void* busObject = nullptr;
 };
 
