@@ -37,9 +37,8 @@ void Fill(DbConnection* conn, int rows) {
     abort();
   char sql[256];
   for (int i = 0; i < rows; ++i) {
-    (void)snprintf(sql, sizeof(sql),
-                   "INSERT INTO t VALUES('com.example.app%d', %d, %f, %lld);", i % 40,
-                   i * 37, i / 7.0, 1717977600000LL + i);
+    (void)snprintf(sql, sizeof(sql), "INSERT INTO t VALUES('com.example.app%d', %d, %f, %lld);",
+                   i % 40, i * 37, i / 7.0, 1717977600000LL + i);
     if (conn->Exec(sql) != 0) abort();
   }
   if (conn->Exec("COMMIT;") != 0) abort();
@@ -114,8 +113,7 @@ void BM_ExecInsert(benchmark::State& state) {
   int64_t i = 0;
   char sql[256];
   for (auto _ : state) {
-    (void)snprintf(sql, sizeof(sql),
-                   "INSERT INTO t VALUES('com.example.clock', 184230, %lld);",
+    (void)snprintf(sql, sizeof(sql), "INSERT INTO t VALUES('com.example.clock', 184230, %lld);",
                    static_cast<long long>(1717977600000LL + ++i));
     if (conn.Exec(sql) != 0) {
       state.SkipWithError("insert failed");
@@ -171,8 +169,7 @@ int main(int argc, char** argv) {
     for (int m = 1; m < 4; ++m) {
       double t = Find(*times, "BM_ExecInsert/" + std::to_string(m));
       if (t > 0) {
-        printf("%s insert %-16s / rollback_full:        %.3f\n", kind, kModes[m].name,
-               t / base);
+        printf("%s insert %-16s / rollback_full:        %.3f\n", kind, kModes[m].name, t / base);
       }
     }
   }

@@ -160,8 +160,7 @@ int DbConnection::Exec(const char* sql) {
 int DbConnection::TableExists(const char* name) {
   if (db == nullptr || name == nullptr) return 0;
   char sql[1024];
-  (void)snprintf(sql, sizeof(sql), "select count(*) from sqlite_master where name in ('%s')",
-                 name);
+  (void)snprintf(sql, sizeof(sql), "select count(*) from sqlite_master where name in ('%s')", name);
   BeginStatement();
   sqlite3_stmt* stmt = nullptr;
   (void)sqlite3_prepare_v2(db, sql, -1, &stmt, nullptr);

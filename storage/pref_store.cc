@@ -42,8 +42,8 @@ void CheckSuffix(const unsigned char* c, char out[6]) {
   out[2] = static_cast<char>('0' + (c[3] + (c[9] & 0xFE) + (c[15] & 0x0F) + (c[16] & 0x0F)) % 10);
   out[3] = static_cast<char>(
       '0' + (c[4] + c[11] + (c[17] & 0x0F) + (c[18] & 0x0F) + (c[24] & 0x0F)) % 10);
-  out[4] = static_cast<char>(
-      'A' + (c[0] + c[6] + (c[10] & 0xF0) + (c[19] & 0x0F) + (c[21] & 0x0F)) % 26);
+  out[4] = static_cast<char>('A' +
+                             (c[0] + c[6] + (c[10] & 0xF0) + (c[19] & 0x0F) + (c[21] & 0x0F)) % 26);
   out[5] = static_cast<char>('a' + (c[8] + (c[12] & 0xFE) + (c[22] & 0x0F) + (c[23] & 0x0F)) % 26);
 }
 
@@ -200,9 +200,7 @@ uint32_t PrefStore::GetSentDate() {
   return GetInt64(kSentDateKey, &value) == 0 ? static_cast<uint32_t>(value) : 0;
 }
 
-int PrefStore::SetLastShutdownTime(int32_t seconds) {
-  return SetInt64(kLastShutdownKey, seconds);
-}
+int PrefStore::SetLastShutdownTime(int32_t seconds) { return SetInt64(kLastShutdownKey, seconds); }
 
 uint32_t PrefStore::GetLastShutdownTime() {
   int64_t value = 0;
