@@ -108,7 +108,7 @@ int DbConnection::Open(const char* path) {
     return -1;
   }
   if (g_encryption) {
-    // Deliberately neither kept nor closed, as the keyed open always did.
+    // Deliberately neither kept nor closed: a store that cannot key ends the start anyway.
     if (GetKeyParams() == nullptr) return -1;
     std::string key = ReadKey();
     if (key.empty()) {

@@ -65,7 +65,7 @@ std::string MakeDeviceId(const char random[12], time_t seconds) {
   std::string id(1, kAlphabet[kFirstCharIndex]);
   id.append(random, kRandomChars);
   // Left-padded with zeros to 13 digits. A longer text keeps only what follows its first 13
-  // digits, as ids always did; the body is then padded back to its length.
+  // digits (deliberate, unreachable before year 318857); the body is then padded back.
   if (len <= kTimeDigits) {
     id.append(kTimeDigits - len, '0');
     id.append(digits, len);
