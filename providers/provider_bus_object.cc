@@ -143,6 +143,10 @@ void Constructed(GObject* object) {
     (void)dbus_connection_add_filter(dbus_g_connection_get_connection(bus), RememberCaller,
                                      nullptr, nullptr);
   }
+  // A retried start builds its providers again while the first objects still hold the paths;
+  // they keep serving (handlers find the table through the registry), and registering twice
+  // would abort the process.
+  if (dbus_g_connection_lookup_g_object(bus, table->objectPath) != nullptr) return;
   dbus_g_connection_register_g_object(bus, table->objectPath, object);
 }
 

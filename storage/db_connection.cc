@@ -21,6 +21,7 @@ bool g_encryption = false;
 // VM steps between stop-flag checks: small enough that a long scan stops within microseconds.
 const int kProgressSteps = 1000;
 const char kKeyLibrary[] = "/usr/lib/libsqlite3.so.0";
+const int kBusyTimeoutMs = 2000;
 const char kJournalPragmas[] = "PRAGMA journal_mode=WAL; PRAGMA synchronous=NORMAL;";
 // Rendered cells are cut at these sizes, terminator included.
 const size_t kNumberBuffer = 20;
@@ -132,6 +133,9 @@ int DbConnection::Open(const char* path) {
   }
   // WAL with synchronous NORMAL: an event's insert costs no fsync; a power cut may drop the
   // last commits but never corrupts the file. A file that refuses it keeps its journal mode.
+  // Another process (a second daemon, logmgrctl) may hold the file for a moment: wait for it
+  // rather than fail the statement.
+  (void)sqlite3_busy_timeout(handle, kBusyTimeoutMs);
   (void)sqlite3_exec(handle, kJournalPragmas, nullptr, nullptr, nullptr);
   sqlite3_progress_handler(handle, kProgressSteps, OnProgress, this);
   db = handle;
