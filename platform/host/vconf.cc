@@ -9,6 +9,7 @@
 #include <sys/inotify.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <map>
 #include <string>
 #include <vector>
@@ -183,6 +184,11 @@ int vconf_unset(const char* in_key) {
 
 int vconf_notify_key_changed(const char* in_key, vconf_callback_fn cb, void* user_data) {
   if (in_key == nullptr || cb == nullptr) return VCONF_ERROR;
+  // The same registration again is accepted but kept once: a caller retrying its start at
+  // every idle turn must not grow the list (and the work of every change) without bound.
+  for (const Watcher& w : TheNotifier().watchers) {
+    if (w.key == in_key && w.cb == cb && w.data == user_data) return VCONF_OK;
+  }
   if (EnsureWatch(in_key) != 0) return VCONF_ERROR;
   TheNotifier().watchers.push_back(Watcher{in_key, cb, user_data});
   return VCONF_OK;
@@ -192,9 +198,9 @@ int vconf_ignore_key_changed(const char* in_key, vconf_callback_fn cb) {
   if (in_key == nullptr || cb == nullptr) return VCONF_ERROR;
   auto& ws = TheNotifier().watchers;
   size_t before = ws.size();
-  for (auto it = ws.begin(); it != ws.end();) {
-    it = (it->key == in_key && it->cb == cb) ? ws.erase(it) : it + 1;
-  }
+  ws.erase(std::remove_if(ws.begin(), ws.end(),
+                          [&](const Watcher& w) { return w.key == in_key && w.cb == cb; }),
+           ws.end());
   return ws.size() < before ? VCONF_OK : VCONF_ERROR;
 }
 

@@ -127,6 +127,8 @@ TEST_F(VconfTest, KeyFileChangesReachTheCallbackOnTheMainContext) {
   Seen seen;
   seen.loop = g_main_loop_new(nullptr, FALSE);
   ASSERT_EQ(vconf_notify_key_changed("memory/sysman/earjack", OnChanged, &seen), 0);
+  // A repeated registration is kept once: one call per change.
+  ASSERT_EQ(vconf_notify_key_changed("memory/sysman/earjack", OnChanged, &seen), 0);
 
   ASSERT_EQ(vconf_set_int("memory/sysman/earjack", 1), 0);
   RunUntilNotified(&seen);
