@@ -10,8 +10,8 @@ logmgrctl select use_app_feature_survey app_id,feature,extra,value | tail -n 3 |
   while read -r row; do info "$row"; done
 
 step "Attempts to reach other tables are refused and change nothing"
-logmgrctl delete use_app_feature_survey --where "0; DROP TABLE use_app_survey" 2>&1 |
+{ logmgrctl delete use_app_feature_survey --where "0; DROP TABLE use_app_survey" 2>&1 || true; } |
   while read -r line; do info "$line"; done
-logmgrctl insert use_app_feature_survey "app_id=x'); --" feature=F 2>&1 |
+{ logmgrctl insert use_app_feature_survey "app_id=x'); --" feature=F 2>&1 || true; } |
   while read -r line; do info "$line"; done
 info "use_app_survey still there: $(logmgrctl show use_app_survey --limit 0 | head -n 1)"

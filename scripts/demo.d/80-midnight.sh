@@ -13,8 +13,22 @@ until summary_sent; do
     echo "demo: no report reached the relay" >&2; exit 1
   fi
 done
-step "The report run handed the day to the relay:"
-logmgrctl outbox | sed 's/^/   /'
+step "The report run handed the day to the relay (logmgrctl outbox shows every field):"
+/usr/bin/python3 - "$OUTBOX" <<'PY'
+import json, sys
+kinds = {"001": "app use", "002": "device feature", "003": "package", "004": "crash",
+         "007": "day summary"}
+header = ("mcc", "mnc", "did", "model", "fw_ver")
+records = [json.loads(l) for l in open(sys.argv[1]) if l.strip()]
+for n, r in enumerate(records, 1):
+    pairs = [p.split("=", 1) for p in r["7"].split("¶")]
+    if n == 1:
+        h = dict(p for p in pairs if p[0] in header)
+        print(f"   from {h.get('model')} (build {h.get('fw_ver')}, SIM {h.get('mcc')}/{h.get('mnc')}),"
+              f" {len(records)} records, svc {r['2']}, type {r['1']}, app {r['8']}")
+    body = "  ".join(f"{k}={v}" for k, v in pairs if k not in header)
+    print(f"   #{n:<3} {r['4']} {kinds.get(r['4'], '?'):<15} {body}")
+PY
 step "The upload queue is empty again"
 info "survey_log: $(db .ServerUploaderDB.db "SELECT count(*) FROM survey_log") records queued"
 step "Rows left in the collection tables (the finished day was condensed and removed)"
