@@ -16,8 +16,6 @@
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
 
-// Needs the real database connection; built once the storage layer provides it.
-#if __has_include("storage/db_connection.cc")
 
 namespace _CorvaneLogManager {
 namespace {
@@ -186,6 +184,5 @@ BENCHMARK(BM_SendThousandRecords)->Unit(benchmark::kMillisecond);
 }  // namespace
 }  // namespace _CorvaneLogManager
 
-#endif  // storage/db_connection.cc
 
 BENCHMARK_MAIN();

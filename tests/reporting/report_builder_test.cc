@@ -2,8 +2,6 @@
 
 #include "reporting_test_env.h"
 
-// Needs the real database connection; built once the storage layer provides it.
-#if __has_include("storage/db_connection.cc")
 
 namespace _CorvaneLogManager {
 namespace {
@@ -197,4 +195,3 @@ TEST_F(ReportBuilderTest, WindowsTileTheDayAcrossSummerTime) {
 }  // namespace
 }  // namespace _CorvaneLogManager
 
-#endif  // storage/db_connection.cc

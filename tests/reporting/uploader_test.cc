@@ -30,8 +30,6 @@ TEST(RowSplitterTest, YieldsEmptyTokensAndNeverNull) {
   EXPECT_EQ(RowSplitter::SplitRows(rows, 0, Uploader::kRecordFields), nullptr);
 }
 
-// Needs the real database connection; built once the storage layer provides it.
-#if __has_include("storage/db_connection.cc")
 
 class UploaderTest : public ReportingTest {
  protected:
@@ -138,7 +136,6 @@ TEST_F(UploaderTest, RelayFailureOnTheThirdRecordKeepsTheRestQueued) {
   }
 }
 
-#endif  // storage/db_connection.cc
 
 }  // namespace
 }  // namespace _CorvaneLogManager
