@@ -2,7 +2,6 @@
 
 #include "reporting_test_env.h"
 
-
 namespace _CorvaneLogManager {
 namespace {
 
