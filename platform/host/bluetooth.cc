@@ -250,6 +250,8 @@ int bt_initialize(void) {
     g_error_free(error);
     return BT_ERROR_OPERATION_FAILED;
   }
+  // A lost bus must not become SIGTERM (a clean stop): see the host pkgmgr client.
+  g_dbus_connection_set_exit_on_close(bus, FALSE);
   g_state = new State();
   g_state->bus = bus;
   g_state->cancel = g_cancellable_new();

@@ -113,6 +113,9 @@ pkgmgr_client* pkgmgr_client_new(client_type ctype) {
     delete client;
     return nullptr;
   }
+  // GDBus would answer a lost bus with SIGTERM, a clean stop with status 0 that no service
+  // manager restarts; the daemon's own connection ends it with a failure instead.
+  g_dbus_connection_set_exit_on_close(client->bus, FALSE);
   client->subscription =
       g_dbus_connection_signal_subscribe(client->bus, nullptr, kInterface, kMember, kPath, nullptr,
                                          G_DBUS_SIGNAL_FLAGS_NONE, OnStatus, client, nullptr);

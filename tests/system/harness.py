@@ -22,10 +22,16 @@ HOST_ENV = os.path.join(SOURCE_DIR, "scripts", "host-env")
 CONSENT_KEY = "db/setting/report_diagnostic_info"
 BUS_NAME = "com.corvane.logmgr"
 DBSPACE = "/opt/usr/dbspace"
+# LOGMGR_VALGRIND=1 runs logmgrd under memcheck; every wait then allows this many times longer.
+VALGRIND = os.environ.get("LOGMGR_VALGRIND", "0") == "1"
+TIMEOUT_SCALE = float(os.environ.get("LOGMGR_TIMEOUT_SCALE", "8" if VALGRIND else "1"))
+VALGRIND_SUPP = os.path.join(SOURCE_DIR, "tests", "valgrind.supp")
+VALGRIND_STATUS = 99
 
 
 def wait_for(condition, timeout=10.0, interval=0.02, message="condition"):
     """Polls |condition| until it returns a true value, which is returned."""
+    timeout *= TIMEOUT_SCALE
     deadline = time.monotonic() + timeout
     while True:
         value = condition()
@@ -34,6 +40,14 @@ def wait_for(condition, timeout=10.0, interval=0.02, message="condition"):
         if time.monotonic() > deadline:
             raise AssertionError(f"timed out after {timeout}s waiting for {message}")
         time.sleep(interval)
+
+
+def valgrind_prefix():
+    """memcheck around logmgrd when LOGMGR_VALGRIND=1: a memory error ends it with status 99."""
+    if not VALGRIND:
+        return []
+    return ["valgrind", "--quiet", f"--error-exitcode={VALGRIND_STATUS}", "--leak-check=no",
+            "--track-origins=no", f"--suppressions={VALGRIND_SUPP}"]
 
 
 class Device:
@@ -113,7 +127,8 @@ class Device:
         env = dict(self.env)
         env.update(extra_env or {})
         log = open(os.path.join(self.sysroot, "logmgrd.out"), "ab")
-        proc = subprocess.Popen(list(prefix) + [os.path.join(BIN_DIR, "logmgrd")], env=env,
+        proc = subprocess.Popen(list(prefix) + valgrind_prefix() +
+                                [os.path.join(BIN_DIR, "logmgrd")], env=env,
                                 stdout=log, stderr=log, stdin=subprocess.DEVNULL)
         log.close()
         self.procs.append(proc)
@@ -127,7 +142,7 @@ class Device:
     def wait_exit(self, proc=None, timeout=10.0):
         proc = proc or self.daemon
         try:
-            return proc.wait(timeout)
+            return proc.wait(timeout * TIMEOUT_SCALE)
         except subprocess.TimeoutExpired:
             raise AssertionError(f"logmgrd did not exit within {timeout}s")
 
@@ -135,6 +150,47 @@ class Device:
         """Waits until the deferred start has created the databases."""
         wait_for(lambda: os.path.exists(self.db_path(".pref.db")), timeout,
                  message="the daemon's start")
+
+    # --- platform faults -------------------------------------------------------------------
+    def host_state(self):
+        path = os.path.join(self.sysroot, "run", "host-env", "state")
+        with open(path) as f:
+            return dict(line.rstrip("\n").split("=", 1) for line in f if "=" in line)
+
+    def _write_host_state(self, state):
+        path = os.path.join(self.sysroot, "run", "host-env", "state")
+        with open(path, "w") as f:
+            f.writelines(f"{k}={v}\n" for k, v in state.items())
+
+    def stop_bus(self):
+        """Ends the private system bus under whatever is connected to it."""
+        state = self.host_state()
+        pid = int(state.pop("bus_pid"))
+        os.kill(pid, signal.SIGTERM)
+        wait_for(lambda: not os.path.exists(f"/proc/{pid}"), message="the bus to end")
+        self._write_host_state(state)
+
+    def start_bus(self):
+        """A new bus daemon on the same socket; its address (new guid) replaces the old one."""
+        config = os.path.join(self.sysroot, "run", "host-env", "system-bus.conf")
+        socket_path = os.path.join(self.sysroot, "run", "dbus", "system_bus_socket")
+        if os.path.exists(socket_path):
+            os.unlink(socket_path)
+        out = subprocess.run(["dbus-daemon", f"--config-file={config}", "--fork",
+                              "--print-address=1", "--print-pid=1"], check=True,
+                             capture_output=True, text=True).stdout.split("\n")
+        state = self.host_state()
+        state["bus_address"], state["bus_pid"] = out[0].strip(), out[1].strip()
+        self._write_host_state(state)
+        self.env["DBUS_SYSTEM_BUS_ADDRESS"] = state["bus_address"]
+
+    def kill_x(self):
+        """Ends Xvfb at once, as a crashed X server would go."""
+        state = self.host_state()
+        pid = int(state.pop("xvfb_pid"))
+        os.kill(pid, signal.SIGKILL)
+        wait_for(lambda: not os.path.exists(f"/proc/{pid}"), message="Xvfb to end")
+        self._write_host_state(state)
 
     def signal(self, signum, proc=None):
         (proc or self.daemon).send_signal(signum)
