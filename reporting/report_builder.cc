@@ -8,6 +8,7 @@
 
 #include "base_log_provider.h"
 #include "log_manager.h"
+#include "reporting/local_midnight.h"
 #include "provider_registry.h"
 #include "reporting/row_splitter.h"
 #include "storage/pref_store.h"
@@ -56,17 +57,6 @@ const Aggregation kAggregations[] = {
 };
 
 bool g_sliceMode = true;
-
-time_t MidnightDaysAgo(time_t now, int days) {
-  struct tm tm;
-  if (localtime_r(&now, &tm) == nullptr) return 0;
-  tm.tm_hour = 0;
-  tm.tm_min = 0;
-  tm.tm_sec = 0;
-  tm.tm_mday -= days;
-  tm.tm_isdst = -1;
-  return mktime(&tm);
-}
 
 // 0 when the time cannot be rendered.
 size_t RenderDate(time_t seconds, char* out, size_t size) {
@@ -143,7 +133,7 @@ int ReportBuilder::RunDaily() {
   PrefStore* prefs = Prefs();
   if (prefs == nullptr) return -1;
   time_t now = static_cast<time_t>((clockFn != nullptr ? clockFn() : SystemClockMs()) / 1000);
-  time_t limit = MidnightDaysAgo(now, 1);
+  time_t limit = LocalMidnightDaysBefore(now, 1);
   time_t day = static_cast<time_t>(prefs->NormaliseSentDate());
   if (day == 0) return -1;
 

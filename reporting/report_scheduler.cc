@@ -16,6 +16,7 @@
 #include "db_connection.h"
 #include "log_manager.h"
 #include "provider_registry.h"
+#include "reporting/local_midnight.h"
 #include "reporting/report_builder.h"
 #include "reporting/row_splitter.h"
 #include "reporting/uploader.h"
@@ -119,15 +120,7 @@ void ReportPair::Destroy() {
 }
 
 time_t ReportScheduler::MidnightDaysAgo(int days) {
-  time_t now = time(nullptr);
-  struct tm tm;
-  if (localtime_r(&now, &tm) == nullptr) return 0;
-  tm.tm_hour = 0;
-  tm.tm_min = 0;
-  tm.tm_sec = 0;
-  tm.tm_mday -= days;
-  tm.tm_isdst = -1;
-  return mktime(&tm);
+  return LocalMidnightDaysBefore(time(nullptr), days);
 }
 
 int ReportScheduler::Create() {
