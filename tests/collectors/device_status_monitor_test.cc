@@ -11,6 +11,7 @@
 #include "provider_registry.h"
 #include "storage/db_manager.h"
 #include "storage/status_snapshot_store.h"
+#include "temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -18,10 +19,6 @@ namespace {
 class DeviceStatusMonitorTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-device-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
     ASSERT_EQ(system(("mkdir -p '" + sysroot + "/opt/usr/dbspace'").c_str()), 0);
     LogManager* manager = LogManager::GetInstance();
     ASSERT_NE(manager, nullptr);
@@ -39,8 +36,6 @@ class DeviceStatusMonitorTest : public ::testing::Test {
     StatusSnapshotStore::DestroyInstance();
     LogManager::GetInstance()->Stop();
     LogManager::DestroyInstance();
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf '" + sysroot + "'").c_str());
   }
   // Feature rows as "app|feature|extra|value;" in insertion order.
   std::string Rows() {
@@ -71,7 +66,8 @@ class DeviceStatusMonitorTest : public ::testing::Test {
     return ts;
   }
 
-  std::string sysroot;
+  TempSysroot tmp{"device"};
+  const std::string sysroot = tmp.path();
   DeviceStatusMonitor monitor;
   StatusSnapshotStore* store = nullptr;
 };

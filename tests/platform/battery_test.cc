@@ -7,6 +7,7 @@
 #include <fstream>
 #include <string>
 #include <vector>
+#include "temp_sysroot.h"
 
 namespace {
 
@@ -18,16 +19,6 @@ struct Supply {
 
 class BatteryTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-battery-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    root = tmpl;
-    setenv("LOGMGR_SYSROOT", root.c_str(), 1);
-  }
-  void TearDown() override {
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf '" + root + "'").c_str());
-  }
   void Install(const std::vector<Supply>& supplies) {
     (void)system(("rm -rf '" + root + "/sys'").c_str());
     for (const Supply& s : supplies) {
@@ -37,7 +28,8 @@ class BatteryTest : public ::testing::Test {
       if (s.capacity != nullptr) std::ofstream(dir + "/capacity") << s.capacity;
     }
   }
-  std::string root;
+  TempSysroot tmp{"battery"};
+  const std::string root = tmp.path();
 };
 
 TEST_F(BatteryTest, ReadsTheFirstBatteryAndRefusesBadContents) {

@@ -9,27 +9,19 @@
 
 #include "vconf.h"
 #include "vconf_store.h"
+#include "temp_sysroot.h"
 
 namespace {
 
 class VconfTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char tmpl[] = "/tmp/vconf-test-XXXXXX";
-    root_ = mkdtemp(tmpl);
-    setenv("LOGMGR_SYSROOT", root_.c_str(), 1);
-  }
-  void TearDown() override {
-    unsetenv("LOGMGR_SYSROOT");
-    std::string cmd = "rm -rf '" + root_ + "'";
-    (void)system(cmd.c_str());
-  }
   void WriteRaw(const std::string& rel, const std::string& text) {
     std::string path = root_ + rel;
     vconf_store::MakeParentDirs(path);
     std::ofstream(path) << text;
   }
-  std::string root_;
+  TempSysroot tmp_{"vconf"};
+  const std::string root_ = tmp_.path();
 };
 
 TEST_F(VconfTest, ParsesOnlyWellFormedLines) {
@@ -71,6 +63,10 @@ TEST_F(VconfTest, RoundTripsEveryTypeUnderTheSysroot) {
   EXPECT_EQ(i, 3);
   EXPECT_EQ(vconf_get_dbl("db/test/ratio", &d), 0);
   EXPECT_EQ(d, 0.1);
+  // A subnormal double is written as decimal text that must still read back.
+  ASSERT_EQ(vconf_set_dbl("db/test/tiny", 5e-310), 0);
+  EXPECT_EQ(vconf_get_dbl("db/test/tiny", &d), 0);
+  EXPECT_EQ(d, 5e-310);
   char* s = vconf_get_str("file/test/name");
   ASSERT_NE(s, nullptr);
   EXPECT_STREQ(s, "hello world");

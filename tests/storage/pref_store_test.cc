@@ -6,27 +6,21 @@
 #include <time.h>
 
 #include <string>
+#include "temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {
 
 class PrefStoreTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-pref-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
-  }
   void TearDown() override {
     (void)store.Close();
-    unsetenv("LOGMGR_SYSROOT");
     unsetenv("TZ");
     tzset();
-    (void)system(("rm -rf '" + sysroot + "'").c_str());
   }
   void MakeDbDir() { ASSERT_EQ(system(("mkdir -p '" + sysroot + "/opt/usr/dbspace'").c_str()), 0); }
-  std::string sysroot;
+  TempSysroot tmp{"pref"};
+  const std::string sysroot = tmp.path();
   PrefStore store;
 };
 

@@ -7,22 +7,15 @@
 #include <sys/stat.h>
 
 #include <string>
+#include "temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {
 
 class StatusSnapshotStoreTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-snapshot-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
-  }
   void TearDown() override {
     StatusSnapshotStore::DestroyInstance();
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf '" + sysroot + "'").c_str());
   }
   StatusSnapshotStore* Open() {
     std::string dir = sysroot + "/opt/usr/dbspace";
@@ -50,7 +43,8 @@ class StatusSnapshotStoreTest : public ::testing::Test {
     sqlite3_close(db);
     return out;
   }
-  std::string sysroot;
+  TempSysroot tmp{"snapshot"};
+  const std::string sysroot = tmp.path();
 };
 
 TEST_F(StatusSnapshotStoreTest, KeepsOneRowPerFeature) {
