@@ -2,7 +2,9 @@
 
 #include <errno.h>
 #include <fcntl.h>
+#include <float.h>
 #include <limits.h>
+#include <math.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -31,7 +33,9 @@ bool ParseDouble(const std::string& s, double* out) {
   errno = 0;
   char* end = nullptr;
   double v = strtod(s.c_str(), &end);
-  if (errno != 0 || *end != '\0') return false;
+  // A subnormal result sets ERANGE yet is the nearest double, and Render writes such values.
+  bool subnormal = errno == ERANGE && v != 0 && fabs(v) < DBL_MIN;
+  if ((errno != 0 && !subnormal) || *end != '\0') return false;
   *out = v;
   return true;
 }
