@@ -42,12 +42,25 @@ def wait_for(condition, timeout=10.0, interval=0.02, message="condition"):
         time.sleep(interval)
 
 
-def valgrind_prefix():
-    """memcheck around logmgrd when LOGMGR_VALGRIND=1: a memory error ends it with status 99."""
+def valgrind_prefix(log_dir):
+    """memcheck around logmgrd when LOGMGR_VALGRIND=1: a memory error ends it with status 99
+    and is written to |log_dir|/valgrind.<pid>.log, which Device.close turns into a failure."""
     if not VALGRIND:
         return []
     return ["valgrind", "--quiet", f"--error-exitcode={VALGRIND_STATUS}", "--leak-check=no",
-            "--track-origins=no", f"--suppressions={VALGRIND_SUPP}"]
+            "--track-origins=no", f"--suppressions={VALGRIND_SUPP}",
+            f"--log-file={os.path.join(log_dir, 'valgrind.%p.log')}"]
+
+
+def valgrind_reports(log_dir):
+    reports = []
+    for name in sorted(os.listdir(log_dir)):
+        if name.startswith("valgrind.") and name.endswith(".log"):
+            with open(os.path.join(log_dir, name)) as f:
+                text = f.read().strip()
+            if text:
+                reports.append(text)
+    return reports
 
 
 class Device:
@@ -127,7 +140,7 @@ class Device:
         env = dict(self.env)
         env.update(extra_env or {})
         log = open(os.path.join(self.sysroot, "logmgrd.out"), "ab")
-        proc = subprocess.Popen(list(prefix) + valgrind_prefix() +
+        proc = subprocess.Popen(list(prefix) + valgrind_prefix(self.sysroot) +
                                 [os.path.join(BIN_DIR, "logmgrd")], env=env,
                                 stdout=log, stderr=log, stdin=subprocess.DEVNULL)
         log.close()
@@ -201,8 +214,11 @@ class Device:
                 proc.send_signal(signal.SIGKILL)
             if proc is not None:
                 proc.wait()
+        reports = valgrind_reports(self.sysroot) if VALGRIND else []
         subprocess.run([HOST_ENV, "stop", self.sysroot], capture_output=True)
         shutil.rmtree(self.sysroot, ignore_errors=True)
+        if reports:
+            raise AssertionError("memcheck found errors in logmgrd:\n" + "\n".join(reports))
 
 
 class DeviceTestCase(unittest.TestCase):
