@@ -107,8 +107,9 @@ inline std::string CheckRowSplitter(const uint8_t* data, size_t size) {
       const char* field = out[static_cast<size_t>(r) * fields + f];
       std::string want = static_cast<size_t>(f) < pieces.size() ? pieces[f] : "";
       if (field == nullptr) return "SplitRows left a null field";
-      if (want != field) return "row " + std::to_string(r) + " field " + std::to_string(f) +
-                                " is \"" + field + "\", not \"" + want + "\"";
+      if (want != field)
+        return "row " + std::to_string(r) + " field " + std::to_string(f) + " is \"" + field +
+               "\", not \"" + want + "\"";
     }
   }
   return "";
@@ -201,8 +202,8 @@ inline std::string CheckBusGuard(const uint8_t* data, size_t size) {
     std::string key = parts[i];
     if (key.size() == 1) key = declared[static_cast<uint8_t>(key[0]) % declared.size()];
     const std::string& value = parts[i + 1];
-    bool allowed = key != "timestamp" && key != "time_zone" &&
-                   value.find('\'') == std::string::npos;
+    bool allowed =
+        key != "timestamp" && key != "time_zone" && value.find('\'') == std::string::npos;
     bool known = false;
     for (const std::string& column : declared) known = known || column == key;
     BusRowLists before = lists;
@@ -228,8 +229,8 @@ inline std::string CheckBusGuard(const uint8_t* data, size_t size) {
     return "lists differ from the accepted entries";
 
   using namespace _CorvaneLogManager;
-  std::string failed = Agree("insert", InsertFits(table, lists, autoTexts),
-                             BuildInsert(table, lists, autoTexts));
+  std::string failed =
+      Agree("insert", InsertFits(table, lists, autoTexts), BuildInsert(table, lists, autoTexts));
   // Wheres: none, the caller's text, and the upsert's (app_id, feature) condition.
   std::vector<const char*> wheres = {nullptr, parts[2].c_str()};
   std::string condition = "app_id='" + appId + "' and feature='" + feature + "'";
@@ -252,11 +253,14 @@ inline bool SameValue(const vconf_store::Value& a, const vconf_store::Value& b) 
   if (a.type != b.type) return false;
   switch (a.type) {
     case VCONF_TYPE_BOOL:
-    case VCONF_TYPE_INT: return a.i == b.i;
+    case VCONF_TYPE_INT:
+      return a.i == b.i;
     case VCONF_TYPE_DOUBLE:
       return isnan(a.d) ? isnan(b.d) : a.d == b.d && signbit(a.d) == signbit(b.d);
-    case VCONF_TYPE_STRING: return a.s == b.s;
-    default: return false;
+    case VCONF_TYPE_STRING:
+      return a.s == b.s;
+    default:
+      return false;
   }
 }
 
