@@ -54,6 +54,10 @@ def query(dev, name, sql, db_dir=None, args=()):
     con = sqlite3.connect(path, timeout=10)
     try:
         return con.execute(sql, args).fetchall()
+    except sqlite3.OperationalError as e:
+        if "no such table" in str(e):  # killed before the daemon created it
+            return []
+        raise
     finally:
         con.close()
 
@@ -104,6 +108,9 @@ class Caller:
         self.ids = []          # ids the daemon returned for committed inserts
         self.deleted = set()   # ids a Delete of ours removed (the daemon counted 1)
         self.failures = []
+
+    def close(self):
+        self.proxy.proxy_object._bus.close()
 
     def insert(self, row):
         try:

@@ -1,0 +1,159 @@
+"""Crash consistency: LOGMGR_CRASH_ROUNDS times (default 100) the daemon is killed with SIGKILL at
+a random moment while a caller inserts over the bus and a report run aggregates, queues and hands
+over records. Each round seeds three finished days first (every other round, so that the other
+rounds leave the crashed files to the daemon alone) or asks for a run through the dump key.
+
+After each kill the files are copied as they lie and the copy must pass integrity_check; the
+copy also gives what the restart recovery must do: every period open in the snapshot store is
+closed at the latest timestamp of the collection tables and the store, so a row of exactly that
+length appears. After the restart the live files must pass integrity_check again, and the items
+the restarted daemon hands to the relay must not hold a day record more often than the queue held
+it at the crash plus one fresh build: a record handed over twice within one send would exceed it.
+"""
+import os
+import random
+import shutil
+import signal
+import sqlite3
+import threading
+import time
+import logging
+import unittest
+from collections import Counter
+
+import soak_support as ss
+from harness import DeviceTestCase, wait_for
+
+logging.getLogger("dbus.proxies").setLevel(logging.CRITICAL)  # introspection of a killed daemon
+ROUNDS = int(os.environ.get("LOGMGR_CRASH_ROUNDS", "100"))
+PERIODS = ("SCRN", "CHAR", "HEAD", "WIFI", "BLUE")
+SEVEN_DAYS_MS = 604800000
+
+
+class CrashTest(DeviceTestCase):
+
+    def setUp(self):
+        os.environ["TZ"] = "UTC"
+        time.tzset()
+        super().setUp()
+        self.dev.env["TZ"] = "UTC"
+        self.dev.set_consent(True)
+        self.dev.vconf_set("memory/pm/state", "int", "1")
+        self.dev.vconf_set("memory/sysman/earjack", "int", "1")
+        self.snap = os.path.join(self.dev.sysroot, "crashed")
+        self.stop = threading.Event()
+        self.inserted = 0
+
+    def inserter(self):
+        caller = None
+        while not self.stop.is_set():
+            try:
+                caller = caller or ss.Caller(self.dev, "use_app_feature_survey")
+                if caller.insert({"app_id": "crash.caller", "feature": "LOAD",
+                                  "value": "1"}) is not None:
+                    self.inserted += 1
+                else:
+                    caller.close()  # the daemon went away: bind to the next one
+                    caller = None
+            except Exception:
+                if caller is not None:
+                    caller.close()
+                caller = None
+                self.stop.wait(0.02)  # the name has no owner between a kill and a restart
+
+    def seed(self, now):
+        """Rows of the three finished days and a sent date that makes them due."""
+        con = sqlite3.connect(self.dev.db_path(".SurveyLog.db"), timeout=10)
+        rnd = random.Random(now)
+        with con:
+            for day in (3, 2, 1):
+                base = ss.utc_midnight(now, day) * 1000
+                for i in range(60):
+                    ts = base + rnd.randrange(86400000)
+                    con.execute("INSERT INTO use_app_survey(timestamp,app_id,duration) "
+                                "VALUES (?,?,?)", (ts, f"com.app{i % 7}", rnd.randrange(9999)))
+                    con.execute("INSERT INTO use_app_feature_survey(timestamp,app_id,feature,"
+                                "extra,value) VALUES (?,?,?,?,?)",
+                                (ts, "crash.seed", f"F{i % 5}", "", 1))
+                    con.execute("INSERT INTO manage_app_survey(timestamp,installed_app_id,type)"
+                                " VALUES (?,?,?)", (ts, f"pkg{i % 4}", i % 3))
+                    con.execute("INSERT INTO report_app_error_survey(timestamp,app_id,type) "
+                                "VALUES (?,?,?)", (ts, f"com.app{i % 3}", 1))
+        con.close()
+        con = sqlite3.connect(self.dev.db_path(".pref.db"), timeout=10)
+        with con:
+            con.execute("INSERT OR REPLACE INTO pref VALUES('key_sent_date', ?)",
+                        (str(ss.utc_midnight(now, 4)),))
+        con.close()
+
+    def crashed_state(self):
+        """Copies the files as the kill left them; what the recovery must write, from the copy."""
+        shutil.rmtree(self.snap, ignore_errors=True)
+        shutil.copytree(self.dev.path("/opt/usr/dbspace"), self.snap)
+        self.assertEqual(ss.integrity(self.dev, self.snap),
+                         {db: "ok" for db in ss.DATABASES}, "files after the kill")
+        ends = [(ss.query(self.dev, ".SurveyLog.db", f"SELECT MAX(timestamp) FROM {t}",
+                          self.snap) or [(0,)])[0][0] or 0 for t in ("use_app_survey", "manage_app_survey",
+                                      "report_app_error_survey", "report_app_status_survey",
+                                      "use_app_feature_survey")]
+        opened = dict(ss.query(self.dev, ".StatusMonitor.db", "SELECT feature, timestamp FROM "
+                               "survey_status_monitor", self.snap))
+        shutdown = ss.pref(self.dev, "key_last_shutdown_time", self.snap) or 0
+        end = shutdown * 1000 if shutdown >= 1 else max(ends + list(opened.values()) + [0])
+        expected = {f: end - opened[f] for f in PERIODS
+                    if (opened.get(f) or 0) > 0 and 1 <= end - opened[f] <= SEVEN_DAYS_MS}
+        last_id = (ss.query(self.dev, ".SurveyLog.db", "SELECT MAX(_id) FROM "
+                            "use_app_feature_survey", self.snap) or [(0,)])[0][0] or 0
+        queued = Counter((a, b) for a, b, _ in ss.queue(self.dev, self.snap) if a != "007")
+        return expected, last_id, queued
+
+    def start(self):
+        proc = self.dev.start_daemon()
+        self.dev.daemon = proc
+        self.assertIsNone(proc.poll(), "logmgrd did not start")
+        return proc
+
+    def test_kill_at_random_points(self):
+        rnd = random.Random(12)
+        feeder = threading.Thread(target=self.inserter)
+        self.addCleanup(feeder.join)
+        self.addCleanup(self.stop.set)
+        proc = self.start()
+        wait_for(lambda: len(ss.integrity(self.dev)) == len(ss.DATABASES), timeout=30,
+                 message="the four databases")
+        feeder.start()
+        closed = sends = 0
+        for rnd_no in range(ROUNDS + 1):
+            last = rnd_no == ROUNDS
+            proc.send_signal(signal.SIGKILL)
+            self.dev.wait_exit(proc)
+            expected, last_id, queued = self.crashed_state()
+            if rnd_no % 2 == 0 and not last and last_id:  # the tables exist
+                self.seed(time.time())
+            before = len(ss.outbox(self.dev))
+            proc = self.start()
+
+            def recovered():
+                rows = ss.query(self.dev, ".SurveyLog.db", "SELECT feature, value FROM "
+                                "use_app_feature_survey WHERE _id > ?", args=(last_id,))
+                return all((f, v) in rows for f, v in expected.items())
+            wait_for(recovered, timeout=30, message=f"periods closed at the crash: {expected}")
+            closed += len(expected)
+            self.assertEqual(ss.integrity(self.dev), {db: "ok" for db in ss.DATABASES})
+            if rnd_no % 2 == 1 and not last:
+                self.dev.vconf_set("db/corvane-log-manager/dumpcontext", "int", "3")
+            if not last:
+                self.stop.wait(rnd.uniform(0, 0.6))  # the random kill point
+            handed = Counter(x for x in ss.outbox(self.dev)[before:] if x[0] != "007")
+            sends += bool(handed)
+            for record, count in handed.items():
+                self.assertLessEqual(count, queued[record] + 1, f"handed over twice: {record}")
+        self.stop.set()
+        feeder.join()
+        print(f"\ncrash: {ROUNDS} kills, {closed} periods closed by recovery, {sends} rounds "
+              f"with hand-overs, {self.inserted} bus inserts committed", flush=True)
+        self.assertGreater(sends, 0)
+
+
+if __name__ == "__main__":
+    unittest.main()
