@@ -48,7 +48,7 @@ def valgrind_prefix(log_dir):
     if not VALGRIND:
         return []
     return ["valgrind", "--quiet", f"--error-exitcode={VALGRIND_STATUS}", "--leak-check=no",
-            "--track-origins=no", f"--suppressions={VALGRIND_SUPP}",
+            "--track-origins=no", "--vgdb=no", f"--suppressions={VALGRIND_SUPP}",
             f"--log-file={os.path.join(log_dir, 'valgrind.%p.log')}"]
 
 
