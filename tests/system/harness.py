@@ -88,13 +88,18 @@ class Device:
         return self.path(os.path.join(DBSPACE, name))
 
     def query(self, db_name, sql, args=()):
-        """Rows of |sql| on a database of the device, read-only, or [] if the file is absent."""
+        """Rows of |sql| on a database of the device, read-only; [] while the file or the table
+        does not exist yet (the daemon creates the file before its tables)."""
         path = self.db_path(db_name)
         if not os.path.exists(path):
             return []
         con = sqlite3.connect(f"file:{path}?mode=ro", uri=True, timeout=5)
         try:
             return con.execute(sql, args).fetchall()
+        except sqlite3.OperationalError as e:
+            if str(e).startswith("no such table"):
+                return []
+            raise
         finally:
             con.close()
 

@@ -58,19 +58,23 @@ class DeviceStatusCase(DeviceTestCase):
 
     def wait_monitoring(self):
         """Unlocks until an UNLO row shows every handler is registered; later rows are new."""
+        # Only an UNLO row counts: the restart recovery writes rows of its own before the
+        # handlers are registered.
         def probe():
-            before = self.max_id()
+            before = self.max_id("UNLO")
             self.dev.devsim("unlock")
             try:
-                return wait_for(lambda: self.max_id() > before, timeout=1.0)
+                return wait_for(lambda: self.max_id("UNLO") > before, timeout=1.0)
             except AssertionError:
                 return False
         wait_for(probe, timeout=30, interval=0, message="the device status monitor")
         self.base = self.max_id()
 
-    def max_id(self):
+    def max_id(self, feature=None):
+        where = " WHERE feature = ?" if feature else ""
         try:
-            rows = self.dev.query(FEATURE_DB, "SELECT MAX(_id) FROM use_app_feature_survey")
+            rows = self.dev.query(FEATURE_DB, "SELECT MAX(_id) FROM use_app_feature_survey" + where,
+                                  (feature,) if feature else ())
         except sqlite3.OperationalError:  # the table is not created yet
             return 0
         return (rows[0][0] or 0) if rows else 0

@@ -125,7 +125,19 @@ class ReportCycleTest(DeviceTestCase):
         self.seed_use_app(midnight(1), 5)
         proc = self.dev.start_daemon()
         self.assertEqual(self.pref("key_sent_date"), midnight(1))
-        self.dev.vconf_set("db/corvane-log-manager/dumpcontext", "int", "2")
+        # The daemon creates the key when it starts watching it; a request is taken once the
+        # sent date moves back (or the run it starts has already moved it forward again).
+        dump = "db/corvane-log-manager/dumpcontext"
+        wait_for(lambda: self.dev.vconf_get(dump) is not None, message="the dump watch")
+
+        def requested():
+            self.dev.vconf_set(dump, "int", "2")
+            try:
+                return wait_for(lambda: self.pref("key_sent_date") != midnight(1) or
+                                self.summaries(), timeout=3)
+            except AssertionError:
+                return False
+        wait_for(requested, timeout=60, interval=0, message="the dump request")
         wait_for(lambda: len(self.summaries()) == 1, timeout=30, message="one summary")
         self.assertEqual(self.summaries(), [self.day_text(midnight(1))])
         self.assertEqual(self.pref("key_sent_date"), midnight(1))
