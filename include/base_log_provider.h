@@ -35,7 +35,7 @@ class BaseLogProvider : public IDbResponseListener {
   BaseLogProvider() = default;
   ~BaseLogProvider() override = default;
 
-  // The order of these virtual operations is part of the design.
+  // Keep these virtual operations in this order: the vtable layout is part of the interface.
   // Creates the table; returns the reseeded insert counter (0..499) or -1.
   virtual int Initialize();
   virtual void EmptyHook() {}

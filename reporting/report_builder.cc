@@ -148,8 +148,8 @@ int ReportBuilder::RunDaily() {
 
     sizeTally.clear();
     for (const char* activity : {"001", "002", "003", "004"}) sizeTally[activity] = 0;
-    for (const Aggregation& spec : kAggregations) {
-      if (Aggregate(spec, day) != 0) return -1;
+    for (const Aggregation& agg : kAggregations) {
+      if (Aggregate(agg, day) != 0) return -1;
     }
     if (WriteSummary(dayText) != 0) return -1;
     (void)prefs->SetSentDate(static_cast<int32_t>(day));
@@ -181,28 +181,28 @@ void ReportBuilder::ComputeWindow(time_t day, int mode, int offsetHours, int len
   snprintf(windowEnd, sizeof(windowEnd), "%lld", end);
 }
 
-int ReportBuilder::Aggregate(const Aggregation& spec, time_t day) {
-  bool slice = g_sliceMode && spec.sliceWindows > 0;
+int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
+  bool slice = g_sliceMode && agg.sliceWindows > 0;
   char columns[200];
-  snprintf(columns, sizeof(columns), "%s%s", spec.columns,
-           slice ? spec.sliceAggregate : spec.plainAggregate);
-  const char* group = slice ? spec.sliceGroup : spec.plainGroup;
-  const char* sumText = slice ? spec.sliceSum : spec.plainSum;
-  int windows = slice ? spec.sliceWindows : 1;
+  snprintf(columns, sizeof(columns), "%s%s", agg.columns,
+           slice ? agg.sliceAggregate : agg.plainAggregate);
+  const char* group = slice ? agg.sliceGroup : agg.plainGroup;
+  const char* sumText = slice ? agg.sliceSum : agg.plainSum;
+  int windows = slice ? agg.sliceWindows : 1;
 
   for (int w = 0; w < windows; ++w) {
     if (slice) {
-      ComputeWindow(day, 2, w * spec.sliceHours, spec.sliceHours);
+      ComputeWindow(day, 2, w * agg.sliceHours, agg.sliceHours);
     } else {
       ComputeWindow(day, 0, 0, 0);
     }
     char where[256];
     snprintf(where, sizeof(where), "timestamp >= %s and timestamp < %s", windowStart, windowEnd);
-    BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(spec.table);
+    BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(agg.table);
     if (provider == nullptr) return -1;
     int rowCount = 0;
     char** rows = nullptr;
-    int selected = spec.grouped
+    int selected = agg.grouped
                        ? provider->SelectGroupedRows(columns, where, nullptr, group, &rowCount, &rows)
                        : provider->SelectRows(columns, where, nullptr, &rowCount, &rows);
     if (selected != 0) {
@@ -211,20 +211,20 @@ int ReportBuilder::Aggregate(const Aggregation& spec, time_t day) {
     }
     int result = 0;
     for (int i = 0; i < rowCount && result == 0 && rows != nullptr; ++i) {
-      result = WriteRow(spec, slice, sumText, rows[i]);
+      result = WriteRow(agg, slice, sumText, rows[i]);
     }
     FreeRows(rows, rowCount);
     if (result != 0) return -1;
   }
-  return PurgeTable(spec.table, windowEnd);
+  return PurgeTable(agg.table, windowEnd);
 }
 
-int ReportBuilder::WriteRow(const Aggregation& spec, bool slice, const char* sumText,
+int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumText,
                             char* rowText) {
   int keyCount = 0;
-  while (spec.keys[keyCount] != nullptr) ++keyCount;
-  bool hasSum = slice && spec.sliceSumsLast;
-  int fieldCount = 1 + keyCount + (spec.grouped ? 1 : 0) + (hasSum ? 1 : 0);
+  while (agg.keys[keyCount] != nullptr) ++keyCount;
+  bool hasSum = slice && agg.sliceSumsLast;
+  int fieldCount = 1 + keyCount + (agg.grouped ? 1 : 0) + (hasSum ? 1 : 0);
   char** fields = RowSplitter::SplitRows(&rowText, 1, fieldCount);
   if (fields == nullptr) return -1;
 
@@ -238,17 +238,17 @@ int ReportBuilder::WriteRow(const Aggregation& spec, bool slice, const char* sum
 
   char body[kBodySize];
   size_t len = BeginBody(body, sizeof(body), date);
-  if (spec.grouped) {
+  if (agg.grouped) {
     AppendF(body, sizeof(body), &len, "sum=%s%scount=%s", sumText, kSeparator,
             fields[1 + keyCount]);
   }
   for (int k = 0; k < keyCount; ++k) {
     const char* value = (hasSum && k == keyCount - 1) ? fields[fieldCount - 1] : fields[1 + k];
-    bool first = !spec.grouped && k == 0;
-    AppendF(body, sizeof(body), &len, "%s%s=%s", first ? "" : kSeparator, spec.keys[k], value);
+    bool first = !agg.grouped && k == 0;
+    AppendF(body, sizeof(body), &len, "%s%s=%s", first ? "" : kSeparator, agg.keys[k], value);
   }
   delete[] fields;
-  return WriteRecord(spec.activity, body);
+  return WriteRecord(agg.activity, body);
 }
 
 size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) const {

@@ -66,8 +66,8 @@ class ReportBuilder {
 
  private:
   PrefStore* Prefs() const;
-  int Aggregate(const Aggregation& spec, time_t day);
-  int WriteRow(const Aggregation& spec, bool slice, const char* sumText, char* rowText);
+  int Aggregate(const Aggregation& agg, time_t day);
+  int WriteRow(const Aggregation& agg, bool slice, const char* sumText, char* rowText);
   int WriteSummary(const char* renderedDay);
   // Header pairs and the date pair, each followed by the separator.
   size_t BeginBody(char* body, size_t size, const char* date) const;

@@ -75,7 +75,7 @@ TEST_F(ServerUploadLogProviderTest, LimitedSelectAppendsLimitWithoutBlank) {
     EXPECT_EQ(rowCount, c.rows);
     EXPECT_EQ(uploadTrace.Take().back(), c.statement);
   }
-  // Kept as designed: a limit without a blank-terminated ORDER BY is invalid SQL, and the
+  // Kept on purpose: a limit without a blank-terminated ORDER BY is invalid SQL, and the
   // inherited select looks in the survey database, which has no survey_log.
   EXPECT_EQ(queue->SelectLimitedRows("_id", "1=1", nullptr, 5, &rowCount, &rows), -1);
   EXPECT_EQ(queue->SelectRows(nullptr, nullptr, nullptr, &rowCount, &rows), 0);

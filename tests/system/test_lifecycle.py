@@ -73,7 +73,7 @@ class LifecycleTest(DeviceTestCase):
     def test_withdrawn_consent_ends_the_daemon_cleanly(self):
         proc = self.started_daemon()
 
-        # A withdrawal before the start has completed is ignored by design, so keep
+        # A withdrawal before the start has completed is ignored on purpose, so keep
         # withdrawing (every set notifies) until the daemon has gone.
         def withdrawn():
             self.dev.set_consent(False)

@@ -38,10 +38,10 @@ std::atomic<long> g_registers{0};
 
 // True when this call (its 1-based number |call|) is the one LOGRELAY_FAIL names for |kind|.
 bool InjectedFailure(const char* kind, long call) {
-  const char* spec = getenv("LOGRELAY_FAIL");
-  if (spec == nullptr) return false;
+  const char* faults = getenv("LOGRELAY_FAIL");
+  if (faults == nullptr) return false;
   size_t kindLen = strlen(kind);
-  for (const char* p = spec; *p != '\0';) {
+  for (const char* p = faults; *p != '\0';) {
     const char* end = strchr(p, ',');
     size_t len = end ? static_cast<size_t>(end - p) : strlen(p);
     if (len > kindLen + 1 && strncmp(p, kind, kindLen) == 0 && p[kindLen] == ':' &&
