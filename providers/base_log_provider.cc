@@ -204,21 +204,11 @@ int BaseLogProvider::SelectGroupedRows(const char* columns, const char* where, c
   DbConnection* conn = SurveyConnection();
   if (conn == nullptr) return -1;
   char sql[kStatementSize];
-  char piece[kStatementSize];
   snprintf(sql, sizeof(sql), "SELECT %s FROM %s", columns == nullptr ? "*" : columns,
            config.tableName.c_str());
-  if (where != nullptr) {
-    snprintf(piece, sizeof(piece), " WHERE %s", where);
-    AppendOrDie(sql, sizeof(sql), piece);
-  }
-  if (groupBy != nullptr) {
-    snprintf(piece, sizeof(piece), " GROUP BY %s", groupBy);
-    AppendOrDie(sql, sizeof(sql), piece);
-  }
-  if (orderBy != nullptr) {
-    snprintf(piece, sizeof(piece), " ORDER BY %s", orderBy);
-    AppendOrDie(sql, sizeof(sql), piece);
-  }
+  AppendClauseOrDie(sql, sizeof(sql), " WHERE %s", where);
+  AppendClauseOrDie(sql, sizeof(sql), " GROUP BY %s", groupBy);
+  AppendClauseOrDie(sql, sizeof(sql), " ORDER BY %s", orderBy);
   AppendOrDie(sql, sizeof(sql), ";");
   return conn->Select(sql, config.tableName.c_str(), rowCount, rows);
 }

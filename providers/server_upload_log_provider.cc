@@ -76,14 +76,8 @@ int ServerUploadLogProvider::SelectLimitedRows(const char* columns, const char* 
   char piece[kStatementSize];
   snprintf(sql, sizeof(sql), "SELECT %s FROM %s", columns == nullptr ? "*" : columns,
            config.tableName.c_str());
-  if (where != nullptr) {
-    snprintf(piece, sizeof(piece), " WHERE %s", where);
-    AppendOrDie(sql, sizeof(sql), piece);
-  }
-  if (orderBy != nullptr) {
-    snprintf(piece, sizeof(piece), " ORDER BY %s", orderBy);
-    AppendOrDie(sql, sizeof(sql), piece);
-  }
+  AppendClauseOrDie(sql, sizeof(sql), " WHERE %s", where);
+  AppendClauseOrDie(sql, sizeof(sql), " ORDER BY %s", orderBy);
   if (limit != kNoLimit) {
     // No leading blank, on purpose: the uploader's ORDER BY text ends with one.
     snprintf(piece, sizeof(piece), "LIMIT %ld", static_cast<long>(limit));

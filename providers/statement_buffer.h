@@ -4,6 +4,7 @@
 #define LOGMGR_PROVIDERS_STATEMENT_BUFFER_H_
 
 #include <stddef.h>
+#include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 
@@ -25,6 +26,15 @@ inline void AppendOrDie(char* buf, size_t size, const char* piece) {
   size_t len = strlen(piece);
   if (used + len >= size) abort();
   memcpy(buf + used, piece, len + 1);
+}
+
+// Formats one clause (|format| holding one %s) with |text| into a statement-sized piece, which
+// cuts it, and appends that; nothing when |text| is null. Not fitting |buf| is fatal.
+inline void AppendClauseOrDie(char* buf, size_t size, const char* format, const char* text) {
+  if (text == nullptr) return;
+  char piece[kStatementSize];
+  (void)snprintf(piece, sizeof(piece), format, text);
+  AppendOrDie(buf, size, piece);
 }
 
 }  // namespace _CorvaneLogManager
