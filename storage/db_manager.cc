@@ -25,11 +25,6 @@ int OpenFixed(DbConnection* connection, const char* path) {
   return connection->Open(logmgr_fixed_path(path, buf, sizeof(buf)));
 }
 
-void Remove(std::vector<IDbResponseListener*>* listeners, IDbResponseListener* listener) {
-  auto it = std::find(listeners->begin(), listeners->end(), listener);
-  if (it != listeners->end()) listeners->erase(it);
-}
-
 // Listeners are providers; anything else has no table to create or trim.
 void InitializeAll(const std::vector<IDbResponseListener*>& listeners) {
   for (IDbResponseListener* listener : listeners) {
@@ -39,6 +34,18 @@ void InitializeAll(const std::vector<IDbResponseListener*>& listeners) {
 }
 
 }  // namespace
+
+void DatabaseOwner::AddListener(IDbResponseListener* listener) { listeners.push_back(listener); }
+
+void DatabaseOwner::RemoveListener(IDbResponseListener* listener) {
+  auto it = std::find(listeners.begin(), listeners.end(), listener);
+  if (it != listeners.end()) listeners.erase(it);
+}
+
+int DatabaseOwner::NotifyInitialize() {
+  InitializeAll(listeners);
+  return 0;
+}
 
 DbManager* DbManager::GetInstance() {
   if (g_dbManager != nullptr) return g_dbManager;
@@ -67,15 +74,6 @@ DbManager::~DbManager() {
 int DbManager::Init() {
   // The connection exists whenever GetInstance handed out the manager.
   if (OpenFixed(connection, kSurveyDbPath) != 0) return -1;
-  InitializeAll(listeners);
-  return 0;
-}
-
-void DbManager::AddListener(IDbResponseListener* listener) { listeners.push_back(listener); }
-
-void DbManager::RemoveListener(IDbResponseListener* listener) { Remove(&listeners, listener); }
-
-int DbManager::NotifyInitialize() {
   InitializeAll(listeners);
   return 0;
 }
@@ -117,17 +115,6 @@ int UploadDbManager::CloseConnection() {
 int UploadDbManager::Init() {
   if (connection == nullptr) return -1;
   if (OpenFixed(connection, kUploadDbPath) != 0) return -1;
-  InitializeAll(listeners);
-  return 0;
-}
-
-void UploadDbManager::AddListener(IDbResponseListener* listener) { listeners.push_back(listener); }
-
-void UploadDbManager::RemoveListener(IDbResponseListener* listener) {
-  Remove(&listeners, listener);
-}
-
-int UploadDbManager::NotifyInitialize() {
   InitializeAll(listeners);
   return 0;
 }

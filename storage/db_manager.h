@@ -10,47 +10,49 @@ namespace _CorvaneLogManager {
 class DbConnection;
 class IDbResponseListener;
 
-class DbManager {
+// What both managers share: one owned connection and the providers whose tables live in its
+// file. Duplicates are kept; removal drops the first equal entry.
+class DatabaseOwner {
  public:
-  static DbManager* GetInstance();
-  static void CloseInstance();
-  // Opens ".SurveyLog.db", then lets every listener create its table.
-  int Init();
   DbConnection* GetConnection() { return connection; }
-  // Duplicates are kept; removal drops the first equal entry.
   void AddListener(IDbResponseListener* listener);
   void RemoveListener(IDbResponseListener* listener);
+  // Lets every listener create its table; kept in the interface, called by nobody.
   int NotifyInitialize();
-  int NotifyDeleteExpired();
   const std::vector<IDbResponseListener*>& Listeners() const { return listeners; }
 
- private:
-  DbManager() = default;
-  ~DbManager();
+ protected:
+  DatabaseOwner() = default;
+  ~DatabaseOwner() = default;
 
   DbConnection* connection = nullptr;
   std::vector<IDbResponseListener*> listeners;
 };
 
-class UploadDbManager {
+class DbManager : public DatabaseOwner {
+ public:
+  static DbManager* GetInstance();
+  static void CloseInstance();
+  // Opens ".SurveyLog.db", then lets every listener create its table.
+  int Init();
+  int NotifyDeleteExpired();
+
+ private:
+  DbManager() = default;
+  ~DbManager();
+};
+
+class UploadDbManager : public DatabaseOwner {
  public:
   static UploadDbManager* GetInstance();
   static void CloseInstance();
   // Opens ".ServerUploaderDB.db", then lets every listener create its table.
   int Init();
-  DbConnection* GetConnection() { return connection; }
-  void AddListener(IDbResponseListener* listener);
-  void RemoveListener(IDbResponseListener* listener);
-  int NotifyInitialize();
-  const std::vector<IDbResponseListener*>& Listeners() const { return listeners; }
 
  private:
   UploadDbManager() = default;
   ~UploadDbManager();
   int CloseConnection();
-
-  DbConnection* connection = nullptr;
-  std::vector<IDbResponseListener*> listeners;
 };
 
 }  // namespace _CorvaneLogManager
