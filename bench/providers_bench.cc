@@ -13,6 +13,7 @@
 #include <string>
 
 #include "base_log_provider.h"
+#include "bench/ratio_reporter.h"
 #include "db_connection.h"
 #include "provider_registry.h"
 #include "storage/db_manager.h"
@@ -127,37 +128,18 @@ BENCHMARK(BM_BarePreparedInsert)
     ->Iterations(2000)
     ->Unit(benchmark::kMicrosecond);
 
-class RatioReporter : public benchmark::ConsoleReporter {
- public:
-  RatioReporter() : ConsoleReporter(OO_Tabular) {}
-  void ReportRuns(const std::vector<Run>& runs) override {
-    for (const Run& run : runs)
-      if (!run.error_occurred) {
-        wall[run.benchmark_name()] = run.GetAdjustedRealTime();
-        cpu[run.benchmark_name()] = run.GetAdjustedCPUTime();
-      }
-    ConsoleReporter::ReportRuns(runs);
-  }
-  std::map<std::string, double> wall;
-  std::map<std::string, double> cpu;
-};
-
 }  // namespace
 
 int main(int argc, char** argv) {
   benchmark::Initialize(&argc, argv);
   Setup();
-  RatioReporter reporter;
+  RatioReporter reporter(benchmark::ConsoleReporter::OO_Tabular);
   benchmark::RunSpecifiedBenchmarks(&reporter);
   Teardown();
   // Wall time includes the journal's fsync, which dominates on a real disk; CPU time shows
   // what the provider itself adds.
   for (auto* times : {&reporter.wall, &reporter.cpu}) {
-    auto find = [&](const std::string& prefix) {
-      for (auto& [name, value] : *times)
-        if (name.rfind(prefix, 0) == 0) return value;
-      return 0.0;
-    };
+    auto find = [&](const std::string& prefix) { return RatioReporter::Find(*times, prefix); };
     double empty = find("BM_InsertRow/0"), full = find("BM_InsertRow/5000");
     double bareEmpty = find("BM_BarePreparedInsert/0");
     double bareFull = find("BM_BarePreparedInsert/5000");

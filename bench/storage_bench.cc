@@ -9,6 +9,7 @@
 #include <map>
 #include <string>
 
+#include "bench/ratio_reporter.h"
 #include "db_connection.h"
 
 using namespace _CorvaneLogManager;
@@ -127,28 +128,6 @@ BENCHMARK(BM_SelectThroughDbConnection)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_BareStepLoop)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_ExecInsert)->DenseRange(0, 3)->Iterations(1000)->Unit(benchmark::kMicrosecond);
 
-class RatioReporter : public benchmark::ConsoleReporter {
- public:
-  void ReportRuns(const std::vector<Run>& runs) override {
-    for (const Run& run : runs) {
-      if (!run.error_occurred) {
-        wall[run.benchmark_name()] = run.GetAdjustedRealTime();
-        cpu[run.benchmark_name()] = run.GetAdjustedCPUTime();
-      }
-    }
-    ConsoleReporter::ReportRuns(runs);
-  }
-  std::map<std::string, double> wall;
-  std::map<std::string, double> cpu;
-};
-
-double Find(const std::map<std::string, double>& times, const std::string& prefix) {
-  for (const auto& [name, value] : times) {
-    if (name.rfind(prefix, 0) == 0) return value;
-  }
-  return 0.0;
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -159,15 +138,15 @@ int main(int argc, char** argv) {
   Teardown();
   for (const auto* times : {&reporter.wall, &reporter.cpu}) {
     const char* kind = times == &reporter.wall ? "wall" : "cpu ";
-    double select = Find(*times, "BM_SelectThroughDbConnection");
-    double bare = Find(*times, "BM_BareStepLoop");
+    double select = RatioReporter::Find(*times, "BM_SelectThroughDbConnection");
+    double bare = RatioReporter::Find(*times, "BM_BareStepLoop");
     if (select > 0 && bare > 0) {
       printf("%s Select of %d rows / bare step loop:      %.2f\n", kind, kRows, select / bare);
     }
-    double base = Find(*times, "BM_ExecInsert/0");
+    double base = RatioReporter::Find(*times, "BM_ExecInsert/0");
     if (base <= 0) continue;
     for (int m = 1; m < 4; ++m) {
-      double t = Find(*times, "BM_ExecInsert/" + std::to_string(m));
+      double t = RatioReporter::Find(*times, "BM_ExecInsert/" + std::to_string(m));
       if (t > 0) {
         printf("%s insert %-16s / rollback_full:        %.3f\n", kind, kModes[m].name, t / base);
       }
