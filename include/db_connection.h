@@ -10,6 +10,7 @@
 #include <atomic>
 
 struct sqlite3;
+struct sqlite3_stmt;
 
 namespace _CorvaneLogManager {
 
@@ -55,6 +56,10 @@ class DbConnection {
   [[noreturn]] void EndInterruptedThread();
   // First column of the last row of |sql|; 0 on failure.
   int64_t ScalarQuery(const char* sql);
+  // Statement start shared by the queries: begins the statement and prepares |sql|. An
+  // interrupted prepare ends the thread; another failure finalises, reports, re-enables
+  // cancellation and returns false.
+  bool PrepareOrFail(const char* sql, sqlite3_stmt** stmt);
 
   sqlite3* db = nullptr;
   // Pending interrupt; consumed by the statement it ends, dropped by Close.

@@ -193,20 +193,27 @@ int64_t DbConnection::MaxTimestamp(const char* table) {
   return ScalarQuery(sql);
 }
 
-int64_t DbConnection::ScalarQuery(const char* sql) {
+bool DbConnection::PrepareOrFail(const char* sql, sqlite3_stmt** stmt) {
   BeginStatement();
-  sqlite3_stmt* stmt = nullptr;
-  int rc = sqlite3_prepare_v2(db, sql, -1, &stmt, nullptr);
+  *stmt = nullptr;
+  int rc = sqlite3_prepare_v2(db, sql, -1, stmt, nullptr);
   if (rc == SQLITE_INTERRUPT) {
-    sqlite3_finalize(stmt);
+    sqlite3_finalize(*stmt);
     EndInterruptedThread();
   }
   if (rc != SQLITE_OK) {
-    sqlite3_finalize(stmt);
+    sqlite3_finalize(*stmt);
     ReportError();
     EnableCancel();
-    return 0;
+    return false;
   }
+  return true;
+}
+
+int64_t DbConnection::ScalarQuery(const char* sql) {
+  sqlite3_stmt* stmt = nullptr;
+  if (!PrepareOrFail(sql, &stmt)) return 0;
+  int rc;
   int64_t value = 0;
   while ((rc = sqlite3_step(stmt)) == SQLITE_ROW) value = sqlite3_column_int64(stmt, 0);
   if (rc == SQLITE_INTERRUPT) {
@@ -226,19 +233,9 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
     *rowCount = 0;
     return 0;
   }
-  BeginStatement();
   sqlite3_stmt* stmt = nullptr;
-  int rc = sqlite3_prepare_v2(db, sql, -1, &stmt, nullptr);
-  if (rc == SQLITE_INTERRUPT) {
-    sqlite3_finalize(stmt);
-    EndInterruptedThread();
-  }
-  if (rc != SQLITE_OK) {
-    sqlite3_finalize(stmt);
-    EnableCancel();
-    ReportError();
-    return -1;
-  }
+  if (!PrepareOrFail(sql, &stmt)) return -1;
+  int rc = SQLITE_ROW;
   int columns = sqlite3_column_count(stmt);
   char** out = new (std::nothrow) char*[capacity];
   // One scratch row for the whole select: no cell renders longer than kTextBuffer - 1.
