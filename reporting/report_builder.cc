@@ -10,6 +10,7 @@
 #include "log_manager.h"
 #include "reporting/local_midnight.h"
 #include "provider_registry.h"
+#include "sql_literal.h"
 #include "reporting/row_splitter.h"
 #include "storage/pref_store.h"
 
@@ -72,21 +73,6 @@ std::string DeviceText(const char* text) {
     if (c == ',') c = ';';
   }
   return out;
-}
-
-// Appends |text| to the NUL-terminated |out| of |size| bytes with every "'" doubled, stopping
-// before a character that would not fit whole. Returns the bytes of |text| taken.
-size_t AppendQuoted(char* out, size_t size, const char* text) {
-  size_t used = strlen(out);
-  size_t taken = 0;
-  for (; text[taken] != '\0'; ++taken) {
-    size_t need = text[taken] == '\'' ? 2 : 1;
-    if (used + need >= size) break;
-    out[used++] = text[taken];
-    if (need == 2) out[used++] = '\'';
-  }
-  out[used] = '\0';
-  return taken;
 }
 
 // Formats at the end of |buf|; a text that does not fit is cut, |*len| stays below |size|.
