@@ -11,6 +11,7 @@
 #include <utility>
 #include <vector>
 
+#include "day_view.h"
 #include "outbox_view.h"
 #include "table_view.h"
 
@@ -38,6 +39,9 @@ const char kUsageText[] =
     "  show TABLE [--limit N]                  newest rows of any log table (read-only)\n"
     "  queue [--limit N]                       the upload queue (read-only)\n"
     "  outbox                                  records handed to the relay library\n"
+    "  day [DATE] [--html FILE]                one local day (YYYY-MM-DD, default today):\n"
+    "                                          apps, device status, events, relay records;\n"
+    "                                          as text, or as a self-contained HTML page\n"
     "TABLE for insert/update/select/delete: use_app_feature_survey or report_app_status_survey.\n"
     "show TABLE: use_app_survey, manage_app_survey, report_app_error_survey,\n"
     "  use_app_feature_survey, report_app_status_survey, survey_log.\n"
@@ -74,8 +78,8 @@ struct Options {
 bool ParseOptions(int argc, char** argv, int first, Options* options, std::string* problem) {
   for (int i = first; i < argc; ++i) {
     const char* arg = argv[i];
-    bool takesValue = strcmp(arg, "--where") == 0 || strcmp(arg, "--size") == 0 ||
-                      strcmp(arg, "--limit") == 0;
+    bool takesValue =
+        strcmp(arg, "--where") == 0 || strcmp(arg, "--size") == 0 || strcmp(arg, "--limit") == 0;
     if (takesValue) {
       if (i + 1 >= argc) {
         *problem = std::string(arg) + " needs a value";
@@ -84,8 +88,8 @@ bool ParseOptions(int argc, char** argv, int first, Options* options, std::strin
       const char* value = argv[++i];
       if (strcmp(arg, "--where") == 0) {
         options->where = value;
-      } else if (!ParseCount(value, strcmp(arg, "--size") == 0 ? &options->size
-                                                                 : &options->limit)) {
+      } else if (!ParseCount(value,
+                             strcmp(arg, "--size") == 0 ? &options->size : &options->limit)) {
         *problem = std::string(arg) + " needs a non-negative number";
         return false;
       }
@@ -278,6 +282,7 @@ int main(int argc, char** argv) {
     return kOk;
   }
   if (strcmp(command, "outbox") == 0) return RunOutboxCommand(argc - 1, argv + 1);
+  if (strcmp(command, "day") == 0) return RunDayCommand(argc - 1, argv + 1);
 
   bool queue = strcmp(command, "queue") == 0;
   int first = queue ? 2 : 3;

@@ -34,15 +34,22 @@ bool ParseString(const std::string& line, size_t* pos, std::string* out) {
     }
     if (++i >= line.size()) return false;
     switch (line[i]) {
-      case 'n': out->push_back('\n'); break;
-      case 't': out->push_back('\t'); break;
-      case 'r': out->push_back('\r'); break;
+      case 'n':
+        out->push_back('\n');
+        break;
+      case 't':
+        out->push_back('\t');
+        break;
+      case 'r':
+        out->push_back('\r');
+        break;
       case 'u':
         if (i + 4 >= line.size()) return false;
         out->push_back(static_cast<char>(strtol(line.substr(i + 1, 4).c_str(), nullptr, 16)));
         i += 4;
         break;
-      default: out->push_back(line[i]);
+      default:
+        out->push_back(line[i]);
     }
   }
   return false;
@@ -52,8 +59,9 @@ void SkipBlanks(const std::string& line, size_t* pos) {
   while (*pos < line.size() && (line[*pos] == ' ' || line[*pos] == '\t')) ++*pos;
 }
 
-// The flat object the relay writes: item number -> text (numbers kept as their digits).
-bool ParseRecord(const std::string& line, std::map<int, std::string>* items) {
+}  // namespace
+
+bool ParseOutboxRecord(const std::string& line, std::map<int, std::string>* items) {
   size_t pos = 0;
   SkipBlanks(line, &pos);
   if (pos >= line.size() || line[pos++] != '{') return false;
@@ -78,6 +86,8 @@ bool ParseRecord(const std::string& line, std::map<int, std::string>* items) {
     if (pos < line.size() && line[pos] == ',') ++pos;
   }
 }
+
+namespace {
 
 std::string RenderTime(const std::string& ms) {
   if (ms.empty()) return "-";
@@ -108,7 +118,7 @@ int RunOutboxCommand(int argc, char** argv) {
     if (line.empty()) continue;
     ++number;
     std::map<int, std::string> items;
-    if (!ParseRecord(line, &items)) {
+    if (!ParseOutboxRecord(line, &items)) {
       printf("#%d  unreadable line: %s\n", number, line.c_str());
       continue;
     }

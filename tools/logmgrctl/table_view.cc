@@ -19,8 +19,8 @@ struct KnownTable {
 };
 
 const KnownTable kTables[] = {
-    {"use_app_survey", kSurveyDb},         {"manage_app_survey", kSurveyDb},
-    {"report_app_error_survey", kSurveyDb}, {"use_app_feature_survey", kSurveyDb},
+    {"use_app_survey", kSurveyDb},           {"manage_app_survey", kSurveyDb},
+    {"report_app_error_survey", kSurveyDb},  {"use_app_feature_survey", kSurveyDb},
     {"report_app_status_survey", kSurveyDb}, {"survey_log", kUploadDb},
 };
 
@@ -28,21 +28,6 @@ const KnownTable* FindTable(const char* name) {
   for (const KnownTable& table : kTables)
     if (strcmp(table.name, name) == 0) return &table;
   return nullptr;
-}
-
-// Opens the database read-only; never creates it. Null (and a message) on failure.
-sqlite3* OpenReadOnly(const char* devicePath) {
-  char buf[4096];
-  const char* path = logmgr_fixed_path(devicePath, buf, sizeof(buf));
-  sqlite3* db = nullptr;
-  if (sqlite3_open_v2(path, &db, SQLITE_OPEN_READONLY, nullptr) != SQLITE_OK) {
-    fprintf(stderr, "logmgrctl: cannot open %s: %s\n", path,
-            db != nullptr ? sqlite3_errmsg(db) : "out of memory");
-    sqlite3_close(db);
-    return nullptr;
-  }
-  sqlite3_busy_timeout(db, 2000);  // the daemon may be writing
-  return db;
 }
 
 int PrintRows(sqlite3* db, const char* table, long limit) {
@@ -54,8 +39,7 @@ int PrintRows(sqlite3* db, const char* table, long limit) {
     return 3;
   }
   int columns = sqlite3_column_count(stmt);
-  for (int c = 0; c < columns; ++c)
-    printf("%s%s", c > 0 ? "\t" : "", sqlite3_column_name(stmt, c));
+  for (int c = 0; c < columns; ++c) printf("%s%s", c > 0 ? "\t" : "", sqlite3_column_name(stmt, c));
   printf("\n");
   int rc;
   while ((rc = sqlite3_step(stmt)) == SQLITE_ROW) {
@@ -74,7 +58,29 @@ int PrintRows(sqlite3* db, const char* table, long limit) {
   return 0;
 }
 
+// Prints the reason a database could not be opened; null passes through.
+sqlite3* OpenOrSay(const char* devicePath) {
+  std::string problem;
+  sqlite3* db = OpenReadOnly(devicePath, &problem);
+  if (db == nullptr) fprintf(stderr, "logmgrctl: %s\n", problem.c_str());
+  return db;
+}
+
 }  // namespace
+
+sqlite3* OpenReadOnly(const char* devicePath, std::string* problem) {
+  char buf[4096];
+  const char* path = logmgr_fixed_path(devicePath, buf, sizeof(buf));
+  sqlite3* db = nullptr;
+  if (sqlite3_open_v2(path, &db, SQLITE_OPEN_READONLY, nullptr) != SQLITE_OK) {
+    *problem = std::string("cannot open ") + path + ": " +
+               (db != nullptr ? sqlite3_errmsg(db) : "out of memory");
+    sqlite3_close(db);
+    return nullptr;
+  }
+  sqlite3_busy_timeout(db, 2000);  // the daemon may be writing
+  return db;
+}
 
 int ShowTable(const char* table, long limit) {
   const KnownTable* known = FindTable(table);
@@ -82,7 +88,7 @@ int ShowTable(const char* table, long limit) {
     fprintf(stderr, "logmgrctl: unknown table '%s' (see logmgrctl --help)\n", table);
     return 2;
   }
-  sqlite3* db = OpenReadOnly(known->database);
+  sqlite3* db = OpenOrSay(known->database);
   if (db == nullptr) return 3;
   int result = PrintRows(db, known->name, limit);
   sqlite3_close(db);
@@ -90,12 +96,11 @@ int ShowTable(const char* table, long limit) {
 }
 
 int ShowQueue(long limit) {
-  sqlite3* db = OpenReadOnly(kUploadDb);
+  sqlite3* db = OpenOrSay(kUploadDb);
   if (db == nullptr) return 3;
   sqlite3_stmt* stmt = nullptr;
   int result = 3;
-  if (sqlite3_prepare_v2(db, "SELECT COUNT(*) FROM survey_log;", -1, &stmt, nullptr) ==
-          SQLITE_OK &&
+  if (sqlite3_prepare_v2(db, "SELECT COUNT(*) FROM survey_log;", -1, &stmt, nullptr) == SQLITE_OK &&
       sqlite3_step(stmt) == SQLITE_ROW) {
     printf("survey_log: %lld queued record(s)\n",
            static_cast<long long>(sqlite3_column_int64(stmt, 0)));
