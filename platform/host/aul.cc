@@ -1,6 +1,7 @@
-// Host aul. Launch and death notices arrive as signals on a private system-bus connection
-// attached to the GLib default main context; a process's application is the one whose
-// executable is the process's /proc/<pid>/exe, seen from inside the sysroot.
+// Host aul. Launch and death notices arrive as signals on the process's shared system-bus
+// connection, attached to the GLib default main context, and count only from a trusted sender;
+// a process's application is the one whose executable is the process's /proc/<pid>/exe, seen
+// from inside the sysroot.
 #include "aul.h"
 
 #include <dbus/dbus-glib-lowlevel.h>
@@ -15,6 +16,7 @@
 #include <vector>
 
 #include "app_db.h"
+#include "sender_trust.h"
 
 namespace {
 
@@ -35,7 +37,8 @@ struct SignalBus {
 
 SignalBus g_bus;
 
-DBusHandlerResult OnMessage(DBusConnection*, DBusMessage* msg, void*) {
+// Never claims a message: the connection is shared with the rest of the process.
+DBusHandlerResult OnMessage(DBusConnection* conn, DBusMessage* msg, void*) {
   if (!dbus_message_has_path(msg, kPath)) return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
   Listener* listener = nullptr;
   if (dbus_message_is_signal(msg, kInterface, "app_launch")) {
@@ -55,25 +58,31 @@ DBusHandlerResult OnMessage(DBusConnection*, DBusMessage* msg, void*) {
   }
   if (pid == 0 || pid > static_cast<dbus_uint32_t>(INT_MAX) || listener->func == nullptr)
     return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+  // Only the launchpad, never any local user, may say that a process started or ended.
+  if (!logmgr_host::SignalSenderTrusted(conn, msg)) return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
   (void)listener->func(static_cast<int>(pid), listener->data);
-  return DBUS_HANDLER_RESULT_HANDLED;
+  return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
 }
 
 int Connect() {
   if (g_bus.conn != nullptr) return 0;
   DBusError err;
   dbus_error_init(&err);
-  DBusConnection* conn = dbus_bus_get_private(DBUS_BUS_SYSTEM, &err);
+  // The shared connection, where the process's other platform signals arrive too: a sender
+  // that pings the process's bus name afterwards then knows this notice has been handled.
+  DBusConnection* conn = dbus_bus_get(DBUS_BUS_SYSTEM, &err);
   if (conn == nullptr) {
     dbus_error_free(&err);
     return -1;
   }
-  // A lost bus must not end the host process.
-  dbus_connection_set_exit_on_disconnect(conn, FALSE);
   dbus_bus_add_match(conn, kRule, &err);
-  if (dbus_error_is_set(&err) || !dbus_connection_add_filter(conn, OnMessage, nullptr, nullptr)) {
+  if (dbus_error_is_set(&err)) {
     dbus_error_free(&err);
-    dbus_connection_close(conn);
+    dbus_connection_unref(conn);
+    return -1;
+  }
+  if (!dbus_connection_add_filter(conn, OnMessage, nullptr, nullptr)) {
+    dbus_bus_remove_match(conn, kRule, nullptr);
     dbus_connection_unref(conn);
     return -1;
   }
@@ -85,8 +94,8 @@ int Connect() {
 void DisconnectIfUnused() {
   if (g_bus.conn == nullptr || g_bus.launch.func != nullptr || g_bus.dead.func != nullptr) return;
   dbus_connection_remove_filter(g_bus.conn, OnMessage, nullptr);
-  dbus_connection_close(g_bus.conn);
-  dbus_connection_unref(g_bus.conn);
+  dbus_bus_remove_match(g_bus.conn, kRule, nullptr);
+  dbus_connection_unref(g_bus.conn);  // shared: never closed here
   g_bus.conn = nullptr;
 }
 

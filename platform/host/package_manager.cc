@@ -1,7 +1,9 @@
 // Host pkgmgr client. Status events are the package manager's broadcast signals on the system
-// bus, received through a GDBus subscription made on (and so dispatched from) the GLib default
-// main context.
-#include <gio/gio.h>
+// bus, received by a filter on the process's shared connection (dispatched from the GLib
+// default main context) and taken only from a trusted sender.
+#include <dbus/dbus-glib-lowlevel.h>
+#include <dbus/dbus.h>
+#include <limits.h>
 #include <string.h>
 
 #include <deque>
@@ -11,12 +13,16 @@
 #include <vector>
 
 #include "package-manager.h"
+#include "sender_trust.h"
 
 namespace {
 
 const char kPath[] = "/org/tizen/pkgmgr_status";
 const char kInterface[] = "org.tizen.pkgmgr_status";
 const char kMember[] = "status";
+const char kRule[] =
+    "type='signal',path='/org/tizen/pkgmgr_status',interface='org.tizen.pkgmgr_status',"
+    "member='status'";
 // Requests whose "end" never comes must not grow the table without bound.
 const size_t kMaxOpenRequests = 64;
 
@@ -28,8 +34,7 @@ struct Listener {
 
 struct Client {
   client_type type = PC_REQUEST;
-  GDBusConnection* bus = nullptr;
-  guint subscription = 0;
+  DBusConnection* bus = nullptr;
   int mask = PKGMGR_CLIENT_STATUS_ALL;
   std::vector<Listener> listeners;
   std::map<std::string, int> kindOfRequest;  // by the installer's request id
@@ -76,17 +81,8 @@ bool Wanted(Client* client, const std::string& request) {
   return (it->second & client->mask) != 0;
 }
 
-void OnStatus(GDBusConnection*, const gchar*, const gchar*, const gchar*, const gchar*,
-              GVariant* params, gpointer userData) {
-  Client* client = static_cast<Client*>(userData);
-  // Anything other than five strings is not a status event.
-  if (!g_variant_is_of_type(params, G_VARIANT_TYPE("(sssss)"))) return;
-  const gchar* request = nullptr;
-  const gchar* pkgType = nullptr;
-  const gchar* pkgid = nullptr;
-  const gchar* key = nullptr;
-  const gchar* val = nullptr;
-  g_variant_get(params, "(&s&s&s&s&s)", &request, &pkgType, &pkgid, &key, &val);
+void Deliver(Client* client, const char* request, const char* pkgType, const char* pkgid,
+             const char* key, const char* val) {
   if (strcmp(key, "start") == 0) Remember(client, request, KindBit(val));
   bool wanted = Wanted(client, request);
   if (strcmp(key, "end") == 0) Forget(client, request);
@@ -99,6 +95,27 @@ void OnStatus(GDBusConnection*, const gchar*, const gchar*, const gchar*, const 
   }
 }
 
+// Never claims a message: the connection is shared with the rest of the process.
+DBusHandlerResult OnMessage(DBusConnection* conn, DBusMessage* msg, void* userData) {
+  // Anything other than five strings is not a status event.
+  if (!dbus_message_is_signal(msg, kInterface, kMember) || !dbus_message_has_path(msg, kPath) ||
+      !dbus_message_has_signature(msg, "sssss"))
+    return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+  // Only the package manager, never any local user, may announce an install.
+  if (!logmgr_host::SignalSenderTrusted(conn, msg)) return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+  const char* s[5] = {};
+  DBusError err;
+  dbus_error_init(&err);
+  if (!dbus_message_get_args(msg, &err, DBUS_TYPE_STRING, &s[0], DBUS_TYPE_STRING, &s[1],
+                             DBUS_TYPE_STRING, &s[2], DBUS_TYPE_STRING, &s[3], DBUS_TYPE_STRING,
+                             &s[4], DBUS_TYPE_INVALID)) {
+    dbus_error_free(&err);
+    return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+  }
+  Deliver(static_cast<Client*>(userData), s[0], s[1], s[2], s[3], s[4]);
+  return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
+}
+
 }  // namespace
 
 extern "C" {
@@ -108,17 +125,28 @@ pkgmgr_client* pkgmgr_client_new(client_type ctype) {
   if (client == nullptr) return nullptr;
   client->type = ctype;
   if (ctype != PC_LISTENING) return client;
-  client->bus = g_bus_get_sync(G_BUS_TYPE_SYSTEM, nullptr, nullptr);
-  if (client->bus == nullptr) {
+  // The shared connection: a lost bus ends the process through it with a failure status, and
+  // a sender that pings the process's bus name afterwards knows its events have been handled.
+  DBusError err;
+  dbus_error_init(&err);
+  DBusConnection* bus = dbus_bus_get(DBUS_BUS_SYSTEM, &err);
+  if (bus != nullptr) {
+    dbus_connection_setup_with_g_main(bus, nullptr);
+    dbus_bus_add_match(bus, kRule, &err);
+  }
+  if (bus == nullptr || dbus_error_is_set(&err)) {
+    dbus_error_free(&err);
+    if (bus != nullptr) dbus_connection_unref(bus);
     delete client;
     return nullptr;
   }
-  // GDBus would answer a lost bus with SIGTERM, a clean stop with status 0 that no service
-  // manager restarts; the daemon's own connection ends it with a failure instead.
-  g_dbus_connection_set_exit_on_close(client->bus, FALSE);
-  client->subscription =
-      g_dbus_connection_signal_subscribe(client->bus, nullptr, kInterface, kMember, kPath, nullptr,
-                                         G_DBUS_SIGNAL_FLAGS_NONE, OnStatus, client, nullptr);
+  if (!dbus_connection_add_filter(bus, OnMessage, client, nullptr)) {
+    dbus_bus_remove_match(bus, kRule, nullptr);
+    dbus_connection_unref(bus);
+    delete client;
+    return nullptr;
+  }
+  client->bus = bus;
   return client;
 }
 
@@ -126,10 +154,10 @@ int pkgmgr_client_free(pkgmgr_client* pc) {
   Client* client = static_cast<Client*>(pc);
   if (client == nullptr) return PKGMGR_R_EINVAL;
   if (client->bus != nullptr) {
-    // Unsubscribed on the dispatching thread, so no callback can follow the delete.
-    if (client->subscription != 0)
-      g_dbus_connection_signal_unsubscribe(client->bus, client->subscription);
-    g_object_unref(client->bus);
+    // Removed on the dispatching thread, so no callback can follow the delete.
+    dbus_connection_remove_filter(client->bus, OnMessage, client);
+    dbus_bus_remove_match(client->bus, kRule, nullptr);
+    dbus_connection_unref(client->bus);  // shared: never closed here
   }
   delete client;
   return PKGMGR_R_OK;
@@ -148,7 +176,7 @@ int pkgmgr_client_listen_status(pkgmgr_client* pc, pkgmgr_handler event_cb, void
   Client* client = static_cast<Client*>(pc);
   if (client == nullptr || event_cb == nullptr || client->type != PC_LISTENING)
     return PKGMGR_R_EINVAL;
-  if (g_nextListenerId == G_MAXINT) g_nextListenerId = 0;
+  if (g_nextListenerId == INT_MAX) g_nextListenerId = 0;
   Listener listener{++g_nextListenerId, event_cb, data};
   client->listeners.push_back(listener);
   return listener.id;

@@ -64,11 +64,16 @@ int TypeFromName(const char* name) {
 
 const char* TypeName(int type) {
   switch (type) {
-    case VCONF_TYPE_BOOL: return "bool";
-    case VCONF_TYPE_INT: return "int";
-    case VCONF_TYPE_DOUBLE: return "double";
-    case VCONF_TYPE_STRING: return "string";
-    default: return nullptr;
+    case VCONF_TYPE_BOOL:
+      return "bool";
+    case VCONF_TYPE_INT:
+      return "int";
+    case VCONF_TYPE_DOUBLE:
+      return "double";
+    case VCONF_TYPE_STRING:
+      return "string";
+    default:
+      return nullptr;
   }
 }
 
@@ -107,7 +112,9 @@ bool Parse(const char* text, size_t len, Value* out) {
 bool Render(const Value& v, std::string* out) {
   char num[64];
   switch (v.type) {
-    case VCONF_TYPE_BOOL: *out = v.i ? "bool 1\n" : "bool 0\n"; return true;
+    case VCONF_TYPE_BOOL:
+      *out = v.i ? "bool 1\n" : "bool 0\n";
+      return true;
     case VCONF_TYPE_INT:
       (void)snprintf(num, sizeof num, "int %d\n", v.i);
       *out = num;
@@ -120,7 +127,8 @@ bool Render(const Value& v, std::string* out) {
       if (v.s.find('\n') != std::string::npos || v.s.find('\0') != std::string::npos) return false;
       *out = "string " + v.s + "\n";
       return true;
-    default: return false;
+    default:
+      return false;
   }
 }
 
@@ -139,7 +147,8 @@ bool KeyPath(const char* key, std::string* path) {
   size_t start = 0;
   while (true) {
     size_t slash = k.find('/', start);
-    std::string part = k.substr(start, slash == std::string::npos ? std::string::npos : slash - start);
+    std::string part =
+        k.substr(start, slash == std::string::npos ? std::string::npos : slash - start);
     if (part.empty() || part == "." || part == "..") return false;
     if (slash == std::string::npos) break;
     start = slash + 1;
@@ -153,8 +162,16 @@ bool KeyPath(const char* key, std::string* path) {
 int Read(const char* key, Value* out) {
   std::string path;
   if (!KeyPath(key, &path)) return VCONF_ERROR_WRONG_PREFIX;
-  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  // The store only ever renames regular files into place. Whatever else sits at a key's path
+  // (a FIFO, a device, a link) was put there by someone else and is refused: opening never
+  // waits for a writer, and a link is not followed.
+  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOFOLLOW | O_NOCTTY);
   if (fd < 0) return errno == ENOENT ? VCONF_ERROR_FILE_NO_ENT : VCONF_ERROR_FILE_OPEN;
+  struct stat st;
+  if (fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
+    close(fd);
+    return VCONF_ERROR_FILE_OPEN;
+  }
   // A key file is one short line; anything longer than this is not ours.
   char buf[8192];
   size_t len = 0;

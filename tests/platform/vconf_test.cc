@@ -3,6 +3,9 @@
 #include <gtest/gtest.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <unistd.h>
 
 #include <fstream>
 #include <string>
@@ -89,6 +92,39 @@ TEST_F(VconfTest, RoundTripsEveryTypeUnderTheSysroot) {
   EXPECT_EQ(vconf_set_str("db/test/newline", "a\nb"), -1);
   WriteRaw("/var/run/memory/garbage", "int twelve\n");
   EXPECT_EQ(vconf_get_int("memory/garbage", &i), -1);
+}
+
+TEST_F(VconfTest, ReadsOnlyRegularKeyFilesAndNeverWaits) {
+  ASSERT_EQ(vconf_set_int("memory/test/good", 7), 0);
+  const std::string dir = root_ + "/var/run/memory/test/";
+  // A FIFO without a writer would block a plain open for good.
+  ASSERT_EQ(mkfifo((dir + "fifo").c_str(), 0644), 0);
+  // The store only renames regular files into place, so a link is someone else's: refused.
+  ASSERT_EQ(symlink((dir + "good").c_str(), (dir + "link").c_str()), 0);
+  ASSERT_EQ(mkdir((dir + "dir").c_str(), 0755), 0);
+  WriteRaw("/var/run/memory/test/huge", "string " + std::string(9000, 'x') + "\n");
+  struct Case {
+    const char* key;
+    int result;
+  } cases[] = {{"memory/test/fifo", VCONF_ERROR_FILE_OPEN},
+               {"memory/test/link", VCONF_ERROR_FILE_OPEN},
+               {"memory/test/dir", VCONF_ERROR_FILE_OPEN},
+               {"memory/test/huge", VCONF_ERROR_WRONG_VALUE},
+               {"memory/test/node", VCONF_ERROR_FILE_OPEN}};
+  // A device node (a copy of /dev/zero's) needs root to make; elsewhere that case is left out.
+  bool node = mknod((dir + "node").c_str(), S_IFCHR | 0644, makedev(1, 5)) == 0;
+  for (const Case& c : cases) {
+    if (!node && strcmp(c.key, "memory/test/node") == 0) continue;
+    SCOPED_TRACE(c.key);
+    vconf_store::Value v;
+    EXPECT_EQ(vconf_store::Read(c.key, &v), c.result);
+    int i = -1;
+    EXPECT_EQ(vconf_get_int(c.key, &i), -1);
+    EXPECT_EQ(i, -1);
+  }
+  int i = -1;
+  EXPECT_EQ(vconf_get_int("memory/test/good", &i), 0);
+  EXPECT_EQ(i, 7);
 }
 
 struct Seen {

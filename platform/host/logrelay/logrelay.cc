@@ -30,7 +30,7 @@ struct corvane_log_item {
 namespace {
 
 constexpr char kOutboxDir[] = "/opt/usr/data/log-relay";
-constexpr char kOutbox[] = "/opt/usr/data/log-relay/outbox.jsonl";
+constexpr char kOutboxName[] = "outbox.jsonl";
 
 std::atomic<long> g_creates{0};
 std::atomic<long> g_sets{0};
@@ -57,11 +57,21 @@ void AppendJsonString(std::string* out, const std::string& text) {
   out->push_back('"');
   for (unsigned char c : text) {
     switch (c) {
-      case '"': *out += "\\\""; break;
-      case '\\': *out += "\\\\"; break;
-      case '\n': *out += "\\n"; break;
-      case '\r': *out += "\\r"; break;
-      case '\t': *out += "\\t"; break;
+      case '"':
+        *out += "\\\"";
+        break;
+      case '\\':
+        *out += "\\\\";
+        break;
+      case '\n':
+        *out += "\\n";
+        break;
+      case '\r':
+        *out += "\\r";
+        break;
+      case '\t':
+        *out += "\\t";
+        break;
       default:
         if (c < 0x20) {
           char esc[8];
@@ -75,16 +85,40 @@ void AppendJsonString(std::string* out, const std::string& text) {
   out->push_back('"');
 }
 
-int MakeDirs(const char* fixedDir) {
-  char buf[4096];
-  std::string path = logmgr_fixed_path(fixedDir, buf, sizeof(buf));
+// Makes |path|'s directories; the last one, if made here, is the relay's own (owner only).
+int MakeDirs(const std::string& path) {
   for (size_t i = 1; i <= path.size(); ++i) {
     if (i == path.size() || path[i] == '/') {
       std::string part = path.substr(0, i);
-      if (mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) return -1;
+      if (mkdir(part.c_str(), i == path.size() ? 0700 : 0755) != 0 && errno != EEXIST) return -1;
     }
   }
   return 0;
+}
+
+// The outbox holds every record on its way off the device, so only its owner may read it,
+// whatever the umask. Neither it nor its directory is reached through a link, and anything but
+// a plain file of ours with no other name (a FIFO, another user's file, a hard link) is refused.
+int OpenOutbox() {
+  char buf[4096];
+  std::string dirPath = logmgr_fixed_path(kOutboxDir, buf, sizeof(buf));
+  if (MakeDirs(dirPath) != 0) return -1;
+  int dir = open(dirPath.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  if (dir < 0) return -1;
+  int fd =
+      openat(dir, kOutboxName,
+             O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY, 0600);
+  close(dir);
+  if (fd < 0) return -1;
+  struct stat st;
+  bool ours =
+      fstat(fd, &st) == 0 && S_ISREG(st.st_mode) && st.st_uid == geteuid() && st.st_nlink == 1;
+  // An outbox left readable by an older build is narrowed rather than refused.
+  if (!ours || ((st.st_mode & 077) != 0 && fchmod(fd, 0600) != 0)) {
+    close(fd);
+    return -1;
+  }
+  return fd;
 }
 
 }  // namespace
@@ -135,16 +169,14 @@ RELAY_API int corvane_log_relay_mobile_register_log_item(corvane_log_item_h hand
   }
   line += "}\n";
 
-  if (MakeDirs(kOutboxDir) != 0) return CORVANE_LOG_RELAY_ERROR_IO;
-  char buf[4096];
-  int fd = open(logmgr_fixed_path(kOutbox, buf, sizeof(buf)),
-                O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+  int fd = OpenOutbox();
   if (fd < 0) return CORVANE_LOG_RELAY_ERROR_IO;
   // One write under O_APPEND keeps concurrent writers' lines whole.
   ssize_t written = write(fd, line.data(), line.size());
   int synced = fsync(fd);
   close(fd);
-  if (written != static_cast<ssize_t>(line.size()) || synced != 0) return CORVANE_LOG_RELAY_ERROR_IO;
+  if (written != static_cast<ssize_t>(line.size()) || synced != 0)
+    return CORVANE_LOG_RELAY_ERROR_IO;
   return CORVANE_LOG_RELAY_ERROR_NONE;
 }
 
