@@ -38,3 +38,10 @@ def send_signal(path, interface, member, *args, signature=None, destination=None
         msg.append(*args, signature=signature)
     bus.send_message(msg)
     bus.flush()
+    # The daemon asks the bus who sent a platform signal; a sender gone by then is nobody.
+    # Its answer to a ping comes after it has handled the signal, so stay connected till then.
+    try:
+        bus.call_blocking("com.corvane.logmgr", "/", "org.freedesktop.DBus.Peer", "Ping", "", (),
+                          timeout=30)
+    except dbus.exceptions.DBusException:
+        pass  # no daemon running: nobody to wait for
