@@ -210,11 +210,12 @@ class DayPageTest(unittest.TestCase):
         cls.clock.advance_ms(6 * 3600 * 1000)
         outbox = cls.dev.path("/opt/usr/data/log-relay/outbox.jsonl")
 
-        def sent():
+        def sent():  # the summary goes first, so the send is over once the queue is empty
             if not os.path.exists(outbox):
                 return False
             with open(outbox) as f:
-                return '"007"' in f.read()
+                return '"007"' in f.read() and cls.dev.query(
+                    ".ServerUploaderDB.db", "SELECT count(*) FROM survey_log") == [(0,)]
 
         def summary():
             cls.dev.vconf_set("memory/system/timechanged", "int", str(cls.clock.now_ms // 1000))
