@@ -33,9 +33,13 @@ void Teardown() { (void)system(("rm -rf '" + g_dir + "'").c_str()); }
 
 // A survey-like table of |rows| rows: a text, two numbers and a timestamp per row.
 void Fill(DbConnection* conn, int rows) {
-  if (conn->Exec("DROP TABLE IF EXISTS t; CREATE TABLE t(app_id TEXT, duration INTEGER, "
-                 "ratio REAL, timestamp INTEGER); BEGIN;") != 0)
-    abort();
+  {
+    DbConnection::SetupScope setup(conn);  // a daemon connection creates tables only here
+    if (conn->Exec("CREATE TABLE IF NOT EXISTS t(app_id TEXT, duration INTEGER, ratio REAL, "
+                   "timestamp INTEGER);") != 0)
+      abort();
+  }
+  if (conn->Exec("DELETE FROM t;") != 0 || conn->Exec("BEGIN;") != 0) abort();
   char sql[256];
   for (int i = 0; i < rows; ++i) {
     (void)snprintf(sql, sizeof(sql), "INSERT INTO t VALUES('com.example.app%d', %d, %f, %lld);",
@@ -92,13 +96,14 @@ void BM_BareStepLoop(benchmark::State& state) {
 
 struct Mode {
   const char* name;
-  const char* pragmas;
+  const char* journal;
+  const char* sync;
 };
 const Mode kModes[] = {
-    {"rollback_full", "PRAGMA journal_mode=DELETE; PRAGMA synchronous=FULL;"},
-    {"rollback_normal", "PRAGMA journal_mode=DELETE; PRAGMA synchronous=NORMAL;"},
-    {"wal_full", "PRAGMA journal_mode=WAL; PRAGMA synchronous=FULL;"},
-    {"wal_normal", "PRAGMA journal_mode=WAL; PRAGMA synchronous=NORMAL;"},
+    {"rollback_full", "PRAGMA journal_mode=DELETE;", "PRAGMA synchronous=FULL;"},
+    {"rollback_normal", "PRAGMA journal_mode=DELETE;", "PRAGMA synchronous=NORMAL;"},
+    {"wal_full", "PRAGMA journal_mode=WAL;", "PRAGMA synchronous=FULL;"},
+    {"wal_normal", "PRAGMA journal_mode=WAL;", "PRAGMA synchronous=NORMAL;"},
 };
 
 // One autocommitted single-row insert per iteration, as a collector event produces.
@@ -107,10 +112,15 @@ void BM_ExecInsert(benchmark::State& state) {
   state.SetLabel(mode.name);
   std::string path = DbFile((std::string(mode.name) + ".db").c_str());
   DbConnection conn;
-  if (conn.Open(path.c_str()) != 0 || conn.Exec(mode.pragmas) != 0 ||
-      conn.Exec("CREATE TABLE IF NOT EXISTS t(app_id TEXT, duration INTEGER, timestamp "
-                "INTEGER);") != 0)
-    abort();
+  if (conn.Open(path.c_str()) != 0) abort();
+  {
+    // One statement per Exec, pragmas and tables only in the open phase.
+    DbConnection::SetupScope setup(&conn);
+    if (conn.Exec(mode.journal) != 0 || conn.Exec(mode.sync) != 0 ||
+        conn.Exec("CREATE TABLE IF NOT EXISTS t(app_id TEXT, duration INTEGER, timestamp "
+                  "INTEGER);") != 0)
+      abort();
+  }
   int64_t i = 0;
   char sql[256];
   for (auto _ : state) {

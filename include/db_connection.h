@@ -1,13 +1,20 @@
 // DbConnection: one SQLite database and the few statement operations the daemon uses.
 // Statements run with thread cancellation disabled; a statement interrupted by Interrupt()
 // ends the calling thread, which is how a running report job is stopped from outside.
+// Every operation runs exactly one statement: a text holding a second one is refused whole.
+// One authorizer, installed at Open, judges each statement by the scope of the thread that
+// prepares it (see storage/statement_policy.h); a scope belongs to one thread, so the report
+// worker's statements stay the daemon's own while the main loop serves a bus request.
 #ifndef LOGMGR_INCLUDE_DB_CONNECTION_H_
 #define LOGMGR_INCLUDE_DB_CONNECTION_H_
 
 #include <pthread.h>
+#include <stddef.h>
 #include <stdint.h>
 
 #include <atomic>
+
+#include "storage/statement_policy.h"
 
 struct sqlite3;
 struct sqlite3_stmt;
@@ -19,8 +26,49 @@ class DbConnection {
   DbConnection() = default;
   ~DbConnection() = default;  // closing is explicit
 
+  // CPU time one bus request's statements may use. A Select of the full 5,000-row table or a
+  // Delete scanning it takes about 10 ms here (docs/SECURITY.md has the measurement).
+  static constexpr int kBusCpuBudgetMs = 1000;
+  // Result columns a bus request's Select may name.
+  static constexpr int kBusMaxColumns = 32;
+
+  // While alive, the calling thread's statements on |conn| are the open phase's: they may set
+  // pragmas and create tables, and wait for a lock another process holds.
+  class SetupScope {
+   public:
+    explicit SetupScope(DbConnection* conn);
+    ~SetupScope();
+    SetupScope(const SetupScope&) = delete;
+    SetupScope& operator=(const SetupScope&) = delete;
+
+   private:
+    DbConnection* conn;
+  };
+
+  // While alive, the calling thread's statements on |conn| serve one bus request: they may
+  // only touch |table|, fail once the thread has used the CPU budget since the scope began,
+  // and a Select fails as soon as its rendered rows (each with a NUL, plus an end byte) would
+  // pass LimitResult's bytes.
+  class BusRequestScope {
+   public:
+    BusRequestScope(DbConnection* conn, const char* table);
+    ~BusRequestScope();
+    BusRequestScope(const BusRequestScope&) = delete;
+    BusRequestScope& operator=(const BusRequestScope&) = delete;
+    // False when the scope could not be entered (no connection, or a scope already held):
+    // the request must then run nothing.
+    bool Held() const { return conn != nullptr; }
+    void LimitResult(size_t bytes);
+    // Whether a Select failed because its result passed the limit.
+    bool ResultTooLarge() const;
+
+   private:
+    DbConnection* conn;
+  };
+
   // 0 if opened or already open; -1 on failure. |path| is a real file path: callers map the
-  // device path with logmgr_fixed_path first.
+  // device path with logmgr_fixed_path first. A new file is made owner-only (0600), whatever
+  // the umask; SQLite gives its -wal and -shm files the same mode.
   int Open(const char* path);
   int Exec(const char* sql);
   // 1 if exactly one schema object of that name exists, else 0.
@@ -44,9 +92,24 @@ class DbConnection {
   void ReportError();
 
   sqlite3* Handle() const { return db; }
+  // Shortens the bus budget (tests and benchmarks); the default fits the daemon.
+  void SetBusCpuBudgetMs(int ms) { busBudgetMs = ms; }
 
  private:
   static int OnProgress(void* self);
+  static int OnAuthorize(void* self, int action, const char* arg1, const char* arg2,
+                         const char* dbName, const char* trigger);
+  static int OnBusy(void* self, int attempts);
+  // The scope of the calling thread's statements: the entered scope for the thread that
+  // entered it, the daemon's own for every other thread.
+  StatementScope ScopeOfThisThread() const;
+  // False (nothing changed) when another scope is already held.
+  bool EnterScope(StatementScope scope, const char* table);
+  void LeaveScope();
+  bool BusBudgetSpent();
+  // After SQLITE_INTERRUPT: returns when the bus budget ended the statement (an ordinary
+  // failure); otherwise ends the thread, as a stop asked.
+  void EndThreadUnlessBudgetSpent(sqlite3_stmt* stmt);
   // True when a statement on the calling thread must stop: an interrupt is pending and was
   // requested by another thread.
   bool StopRequestedForThisThread() const;
@@ -59,9 +122,19 @@ class DbConnection {
   // Statement start shared by the queries: begins the statement and prepares |sql|. An
   // interrupted prepare ends the thread; another failure finalises, reports, re-enables
   // cancellation and returns false.
-  bool PrepareOrFail(const char* sql, sqlite3_stmt** stmt);
+  // A text with more than one statement (or none) fails like a bad one.
+  bool PrepareOrFail(const char* sql, sqlite3_stmt** stmt, bool enableCancelOnFailure = true);
 
   sqlite3* db = nullptr;
+  std::atomic<StatementScope> scope{StatementScope::kDaemon};
+  std::atomic<pthread_t> scopeThread{};
+  // The rest of the scope is read only by the thread that entered it.
+  const char* scopeTable = nullptr;
+  int busBudgetMs = kBusCpuBudgetMs;
+  int64_t busCpuDeadlineNs = 0;
+  bool busBudgetSpent = false;
+  size_t resultLimit = 0;
+  bool resultTooLarge = false;
   // Pending interrupt; consumed by the statement it ends, dropped by Close.
   std::atomic<bool> stopRequested{false};
   std::atomic<pthread_t> stopRequester{};

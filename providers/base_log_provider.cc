@@ -106,7 +106,11 @@ int32_t BaseLogProvider::TickInsertCounter() {
 int BaseLogProvider::Initialize() {
   DbConnection* conn = SurveyConnection();
   if (conn == nullptr) return 0;
-  if (conn->Exec(GetCreateTableSql()) != 0) return -1;
+  {
+    // Creating the table is the one schema change the connection allows, and only here.
+    DbConnection::SetupScope setup(conn);
+    if (conn->Exec(GetCreateTableSql()) != 0) return -1;
+  }
   if (conn->TableExists(config.tableName.c_str()) == 1)
     config.insert_counter = GetRowCount() % kTrimBatch;
   else

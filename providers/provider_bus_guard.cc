@@ -1,10 +1,12 @@
 #include "providers/provider_bus_guard.h"
 
-#include <sqlite3.h>
+#include <errno.h>
+#include <fcntl.h>
 #include <stdio.h>
 #include <string.h>
 #include <sys/ipc.h>
 #include <sys/shm.h>
+#include <sys/stat.h>
 #include <sys/time.h>
 #include <unistd.h>
 
@@ -42,14 +44,46 @@ size_t SetLength(const std::string& columns, const std::string& values) {
   return length;
 }
 
-// Functions that make large values out of little input, or reach outside the database.
-bool IsDeniedFunction(const char* name) {
-  static const char* const kDenied[] = {"randomblob", "zeroblob",  "load_extension",
-                                        "readfile",   "writefile", "fts3_tokenizer"};
-  if (name == nullptr) return true;
-  for (const char* denied : kDenied)
-    if (strcasecmp(name, denied) == 0) return true;
-  return false;
+bool IsCallerRowId(const char* value) {
+  if (value[0] == '\0') return false;
+  long long id = 0;
+  for (const char* p = value; *p != '\0'; ++p) {
+    if (*p < '0' || *p > '9') return false;
+    id = id * 10 + (*p - '0');
+    if (id > kMaxCallerRowId) return false;
+  }
+  return id >= 1;
+}
+
+// Copies |length| bytes to |dst| through a pipe, so that the kernel, not this process, touches
+// the caller's pages: a page that cannot be had (a hugetlb segment without reserve) is then an
+// EFAULT here instead of a SIGBUS that would end the daemon.
+bool CopyThroughKernel(char* dst, const char* src, size_t length) {
+  int fds[2];
+  if (pipe2(fds, O_CLOEXEC | O_NONBLOCK) != 0) return false;
+  bool ok = true;
+  size_t done = 0;
+  while (ok && done < length) {
+    ssize_t in = write(fds[1], src + done, length - done);
+    if (in < 0 && errno == EINTR) continue;
+    if (in <= 0) {
+      ok = false;
+      break;
+    }
+    for (size_t got = 0; got < static_cast<size_t>(in);) {
+      ssize_t out = read(fds[0], dst + done + got, static_cast<size_t>(in) - got);
+      if (out < 0 && errno == EINTR) continue;
+      if (out <= 0) {
+        ok = false;
+        break;
+      }
+      got += static_cast<size_t>(out);
+    }
+    done += static_cast<size_t>(in);
+  }
+  (void)close(fds[0]);
+  (void)close(fds[1]);
+  return ok;
 }
 
 }  // namespace
@@ -58,6 +92,7 @@ int AppendRowEntry(const std::vector<std::string>& declared, const char* key, co
                    BusRowLists* lists) {
   if (key == nullptr || value == nullptr || IsAutoColumn(key) || strchr(value, '\'') != nullptr)
     return -1;
+  if (strcmp(key, "_id") == 0 && !IsCallerRowId(value)) return -1;
   bool known = false;
   for (const std::string& column : declared) known = known || column == key;
   if (!known) return -1;
@@ -67,6 +102,7 @@ int AppendRowEntry(const std::vector<std::string>& declared, const char* key, co
   }
   lists->columns.append(key);
   lists->values.append("'").append(value).append("'");
+  if (strchr(value, ',') != nullptr) lists->valueHasComma = true;
   return 0;
 }
 
@@ -126,61 +162,49 @@ bool DeleteFits(const std::string& table, const char* where) {
   return strlen("DELETE FROM  WHERE ;") + table.size() + strlen(where) < kStatementSize;
 }
 
-TableOnlyAuthorizer::TableOnlyAuthorizer(sqlite3* db, const char* table) : db(db), table(table) {
-  if (db == nullptr) return;
-  savedLength = sqlite3_limit(db, SQLITE_LIMIT_LENGTH, kRequestMaxLength);
-  (void)sqlite3_set_authorizer(db, &TableOnlyAuthorizer::Decide, this);
-}
-
-TableOnlyAuthorizer::~TableOnlyAuthorizer() {
-  if (db == nullptr) return;
-  (void)sqlite3_set_authorizer(db, nullptr, nullptr);
-  (void)sqlite3_limit(db, SQLITE_LIMIT_LENGTH, savedLength);
-}
-
-int TableOnlyAuthorizer::Decide(void* self, int action, const char* arg1, const char* arg2,
-                                const char* db, const char*) {
-  const char* own = static_cast<TableOnlyAuthorizer*>(self)->table;
-  bool ownTable = arg1 != nullptr && strcmp(arg1, own) == 0 &&
-                  (db == nullptr || strcmp(db, "main") == 0);
-  switch (action) {
-    case SQLITE_SELECT:
-      return SQLITE_OK;
-    case SQLITE_READ:
-    case SQLITE_INSERT:
-    case SQLITE_UPDATE:
-    case SQLITE_DELETE:
-      return ownTable ? SQLITE_OK : SQLITE_DENY;
-    case SQLITE_FUNCTION:
-      return IsDeniedFunction(arg2) ? SQLITE_DENY : SQLITE_OK;
-    default:
-      // Everything else (ATTACH, DDL, PRAGMA, transactions, VACUUM, recursive queries).
-      return SQLITE_DENY;
-  }
-}
-
 size_t SegmentBytes(char** rows, int rowCount) {
   size_t bytes = 1;
   for (int i = 0; i < rowCount; ++i) bytes += strlen(rows[i]) + 1;
   return bytes;
 }
 
-int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
+size_t SegmentRoom(int shmId, uid_t callerUid) {
   struct shmid_ds info;
-  if (shmctl(shmId, IPC_STAT, &info) != 0) return -1;
-  if (info.shm_perm.uid != callerUid) return -1;
-  if (SegmentBytes(rows, rowCount) > info.shm_segsz) return -1;
+  if (shmctl(shmId, IPC_STAT, &info) != 0) return 0;
+  if (info.shm_perm.uid != callerUid || (info.shm_perm.mode & S_IWUSR) == 0) return 0;
+  return info.shm_segsz;
+}
+
+int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
+  // Attached first and checked after: an attached segment keeps its id, so what is checked is
+  // what is written, even if the caller removes it and makes another meanwhile.
   void* base = shmat(shmId, nullptr, 0);
   if (base == reinterpret_cast<void*>(-1)) return -1;
-  char* out = static_cast<char*>(base);
-  for (int i = 0; i < rowCount; ++i) {
-    size_t length = strlen(rows[i]) + 1;
-    memcpy(out, rows[i], length);
-    out += length;
-  }
-  *out = '&';
+  size_t bytes = SegmentBytes(rows, rowCount);
+  bool ok = bytes <= SegmentRoom(shmId, callerUid);
+  // Staged in chunks so that each reaches the segment in one copy.
+  char chunk[16384];
+  size_t staged = 0;
+  size_t written = 0;
+  auto stage = [&](const char* data, size_t length) {
+    while (ok && length > 0) {
+      size_t take = length < sizeof(chunk) - staged ? length : sizeof(chunk) - staged;
+      memcpy(chunk + staged, data, take);
+      staged += take;
+      data += take;
+      length -= take;
+      if (staged == sizeof(chunk)) {
+        ok = CopyThroughKernel(static_cast<char*>(base) + written, chunk, staged);
+        written += staged;
+        staged = 0;
+      }
+    }
+  };
+  for (int i = 0; ok && i < rowCount; ++i) stage(rows[i], strlen(rows[i]) + 1);
+  stage("&", 1);
+  if (ok && staged > 0) ok = CopyThroughKernel(static_cast<char*>(base) + written, chunk, staged);
   (void)shmdt(base);
-  return 0;
+  return ok ? 0 : -1;
 }
 
 void FreeRows(char** rows, int rowCount) {

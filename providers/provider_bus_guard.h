@@ -10,8 +10,6 @@
 #include <string>
 #include <vector>
 
-struct sqlite3;
-
 namespace _CorvaneLogManager {
 
 // Column and value lists built from a caller's row_data, plus the texts the provider will
@@ -19,11 +17,17 @@ namespace _CorvaneLogManager {
 struct BusRowLists {
   std::string columns;
   std::string values;
+  // An update cuts both lists at commas, so such a value would turn into SQL there.
+  bool valueHasComma = false;
 };
 
+// Largest _id a caller may give: every later automatic id still fits a double exactly and
+// stays far below the rowid limit, so the table never runs out of ids.
+constexpr long long kMaxCallerRowId = 1LL << 53;
+
 // Appends one row_data entry: "," between entries, the key, the value in single quotes.
-// -1 (lists unchanged) when the key is not a declared column, is timestamp or time_zone, or the
-// value holds a single quote.
+// -1 (lists unchanged) when the key is not a declared column, is timestamp or time_zone, the
+// value holds a single quote, or an _id is not a decimal integer from 1 to kMaxCallerRowId.
 int AppendRowEntry(const std::vector<std::string>& declared, const char* key, const char* value,
                    BusRowLists* lists);
 
@@ -38,31 +42,17 @@ bool UpdateFits(const std::string& table, const BusRowLists& lists, const BusRow
 bool SelectFits(const std::string& table, const char* columns, const char* where);
 bool DeleteFits(const std::string& table, const char* where);
 
-// While alive, statements prepared on |db| may only read and write |table|: no other table, no
-// ATTACH/DETACH, DDL, PRAGMA, transactions, recursive queries or blob-making functions, and no
-// value longer than kRequestMaxLength. A denied statement fails to prepare.
-class TableOnlyAuthorizer {
- public:
-  static constexpr int kRequestMaxLength = 1 << 20;
-  TableOnlyAuthorizer(sqlite3* db, const char* table);
-  ~TableOnlyAuthorizer();
-  TableOnlyAuthorizer(const TableOnlyAuthorizer&) = delete;
-  TableOnlyAuthorizer& operator=(const TableOnlyAuthorizer&) = delete;
-
- private:
-  static int Decide(void* self, int action, const char* arg1, const char* arg2, const char* db,
-                    const char* trigger);
-  sqlite3* db;
-  const char* table;
-  int savedLength = 0;
-};
-
 // Bytes a select result takes in the segment: each row text and its NUL, then the "&" mark.
 size_t SegmentBytes(char** rows, int rowCount);
 
+// Bytes segment |shmId| may take: its size when it exists, belongs to |callerUid| and lets its
+// owner write; 0 otherwise.
+size_t SegmentRoom(int shmId, uid_t callerUid);
+
 // Writes the rows into System V segment |shmId| and detaches it. 0 on success; -1 without
-// writing anything when the segment is unknown, not owned by |callerUid|, too small for the
-// whole result, or cannot be attached.
+// writing anything when the segment is unknown, not owned by |callerUid|, not writable by its
+// owner, too small for the whole result, or cannot be attached; -1 too when a page of it
+// cannot be had (the copy stops there, and the daemon carries on).
 int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount);
 
 // Frees a select result (each row text, then the array).

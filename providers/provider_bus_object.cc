@@ -26,8 +26,7 @@ gboolean logmgr_provider_bus_update(GObject* self, GHashTable* rowData, const ch
                                     gint* count, GError** error);
 gboolean logmgr_provider_bus_select(GObject* self, const char* columns, const char* where,
                                     const char* order, guint shmId, GError** error);
-gboolean logmgr_provider_bus_delete(GObject* self, const char* where, gint* count,
-                                    GError** error);
+gboolean logmgr_provider_bus_delete(GObject* self, const char* where, gint* count, GError** error);
 
 }  // namespace
 
@@ -70,12 +69,12 @@ struct BusTable {
 const BusTable kBusTables[] = {
     {"use_app_feature_survey", "LogProviderInterfaceUseAppFeatureSurvey",
      "/com/corvane/logmgr/log/provider/use_app_feature_survey", "g-logmgr-useappfeature-error",
-     &dbus_glib_use_app_feature_survey_object_info, InsertMode::kPlain, "Update API Failed",
-     true, true, &kUseAppFeatureShmPath},
+     &dbus_glib_use_app_feature_survey_object_info, InsertMode::kPlain, "Update API Failed", true,
+     true, &kUseAppFeatureShmPath},
     {"report_app_status_survey", "LogProviderInterfaceReportAppStatusSurvey",
-     "/com/corvane/logmgr/log/provider/report_app_status_survey",
-     "g-logmgr-reportappstatus-error", &dbus_glib_report_app_status_survey_object_info,
-     InsertMode::kUpsertOnAppFeature, kImproperValues, false, false, &kReportAppStatusShmPath},
+     "/com/corvane/logmgr/log/provider/report_app_status_survey", "g-logmgr-reportappstatus-error",
+     &dbus_glib_report_app_status_survey_object_info, InsertMode::kUpsertOnAppFeature,
+     kImproperValues, false, false, &kReportAppStatusShmPath},
 };
 constexpr size_t kTableCount = sizeof(kBusTables) / sizeof(kBusTables[0]);
 
@@ -140,8 +139,8 @@ void Constructed(GObject* object) {
   if (bus == nullptr) return;
   if (gBus != bus) {
     gBus = bus;
-    (void)dbus_connection_add_filter(dbus_g_connection_get_connection(bus), RememberCaller,
-                                     nullptr, nullptr);
+    (void)dbus_connection_add_filter(dbus_g_connection_get_connection(bus), RememberCaller, nullptr,
+                                     nullptr);
   }
   // A retried start builds its providers again while the first objects still hold the paths;
   // they keep serving (handlers find the table through the registry), and registering twice
@@ -187,8 +186,7 @@ GType TypeOf(size_t index) {
 }
 
 gboolean Fail(const BusTable* table, GError** error, const char* message) {
-  g_set_error_literal(error, g_quark_from_static_string(table->errorDomain), kErrorCode,
-                      message);
+  g_set_error_literal(error, g_quark_from_static_string(table->errorDomain), kErrorCode, message);
   return FALSE;
 }
 
@@ -197,10 +195,9 @@ BaseLogProvider* LookupProvider(const BusTable* table) {
   return registry == nullptr ? nullptr : registry->Lookup(table->tableName);
 }
 
-sqlite3* SurveyHandle() {
+DbConnection* SurveyConnection() {
   DbManager* manager = DbManager::GetInstance();
-  DbConnection* conn = manager == nullptr ? nullptr : manager->GetConnection();
-  return conn == nullptr ? nullptr : conn->Handle();
+  return manager == nullptr ? nullptr : manager->GetConnection();
 }
 
 // row_data as the provider's column and value lists; -1 when an entry is refused.
@@ -224,12 +221,12 @@ bool HasKey(GHashTable* rowData, const char* key) {
 
 gboolean PlainInsert(const BusTable* table, BaseLogProvider* provider, const BusRowLists& lists,
                      gint* lastRowId, GError** error) {
-  if (!InsertFits(provider->Config().tableName, lists,
-                  AutoColumnTexts(provider->Config().columns)))
+  if (!InsertFits(provider->Config().tableName, lists, AutoColumnTexts(provider->Config().columns)))
     return Fail(table, error, kImproperValues);
-  TableOnlyAuthorizer guard(SurveyHandle(), table->tableName);
+  DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
   int32_t rowId = -1;
-  if (provider->InsertRow(lists.columns.c_str(), lists.values.c_str(), &rowId) == -1)
+  if (!scope.Held() ||
+      provider->InsertRow(lists.columns.c_str(), lists.values.c_str(), &rowId) == -1)
     return Fail(table, error, kInsertFailed);
   *lastRowId = rowId;
   return TRUE;
@@ -238,18 +235,17 @@ gboolean PlainInsert(const BusTable* table, BaseLogProvider* provider, const Bus
 // One row per (app_id, feature): an existing row is updated, a missing one inserted.
 gboolean UpsertInsert(const BusTable* table, BaseLogProvider* provider, GHashTable* rowData,
                       const BusRowLists& lists, gint* lastRowId, GError** error) {
-  std::string condition = std::string("app_id='") +
-                          static_cast<const char*>(g_hash_table_lookup(rowData, "app_id")) +
-                          "' and feature='" +
-                          static_cast<const char*>(g_hash_table_lookup(rowData, "feature")) + "'";
+  std::string condition =
+      std::string("app_id='") + static_cast<const char*>(g_hash_table_lookup(rowData, "app_id")) +
+      "' and feature='" + static_cast<const char*>(g_hash_table_lookup(rowData, "feature")) + "'";
   const std::string& tableName = provider->Config().tableName;
   BusRowLists autoTexts = AutoColumnTexts(provider->Config().columns);
-  if (!SelectFits(tableName, "_id", condition.c_str()) ||
-      !InsertFits(tableName, lists, autoTexts) ||
-      !UpdateFits(tableName, lists, autoTexts, condition.c_str()))
+  // The update's 200-byte lists and its comma split only matter when the pair exists.
+  if (!SelectFits(tableName, "_id", condition.c_str()) || !InsertFits(tableName, lists, autoTexts))
     return Fail(table, error, kImproperValues);
 
-  TableOnlyAuthorizer guard(SurveyHandle(), table->tableName);
+  DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
+  if (!scope.Held()) return Fail(table, error, kApiFailed);
   int rowCount = 0;
   char** rows = nullptr;
   int selected = provider->SelectRows("_id", condition.c_str(), nullptr, &rowCount, &rows);
@@ -260,8 +256,9 @@ gboolean UpsertInsert(const BusTable* table, BaseLogProvider* provider, GHashTab
   if (selected == -1) return Fail(table, error, kApiFailed);
   if (rowCount == 1) {
     *lastRowId = static_cast<gint>(existingId);
-    if (provider->UpdateRows(lists.columns.c_str(), lists.values.c_str(), condition.c_str()) ==
-        -1)
+    if (lists.valueHasComma || !UpdateFits(tableName, lists, autoTexts, condition.c_str()))
+      return Fail(table, error, kApiFailed);
+    if (provider->UpdateRows(lists.columns.c_str(), lists.values.c_str(), condition.c_str()) == -1)
       return Fail(table, error, kApiFailed);
     return TRUE;
   }
@@ -298,43 +295,46 @@ gboolean logmgr_provider_bus_update(GObject* self, GHashTable* rowData, const ch
   if (BuildLists(provider, rowData, &lists) != 0) return Fail(table, error, table->updateFailure);
   // No where at all makes the provider refuse the update.
   const char* condition = where != nullptr && where[0] != '\0' ? where : nullptr;
-  if (!UpdateFits(provider->Config().tableName, lists,
-                  AutoColumnTexts(provider->Config().columns), condition))
+  if (lists.valueHasComma || !UpdateFits(provider->Config().tableName, lists,
+                                         AutoColumnTexts(provider->Config().columns), condition))
     return Fail(table, error, table->updateFailure);
-  TableOnlyAuthorizer guard(SurveyHandle(), table->tableName);
+  DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
   int32_t changed = 0;
-  if (provider->UpdateRows(lists.columns.c_str(), lists.values.c_str(), condition, &changed) ==
-      -1)
+  if (!scope.Held() ||
+      provider->UpdateRows(lists.columns.c_str(), lists.values.c_str(), condition, &changed) == -1)
     return Fail(table, error, table->updateFailure);
   *count = changed;
   return TRUE;
 }
 
-gboolean logmgr_provider_bus_select(GObject* self, const char* columns, const char*,
-                                    const char*, guint shmId, GError**) {
+gboolean logmgr_provider_bus_select(GObject* self, const char* columns, const char*, const char*,
+                                    guint shmId, GError**) {
   const BusTable* table = TableOf(self);
   if (table == nullptr) return FALSE;
   BaseLogProvider* provider = LookupProvider(table);
   if (provider == nullptr) return kProviderMissing;
   // where and order are accepted and ignored: every row of the table is returned, deliberately.
   // A failed select answers -1 without an error, as the binding reports it.
-  if (columns == nullptr || !SelectFits(provider->Config().tableName, columns, nullptr))
-    return -1;
+  if (columns == nullptr || !SelectFits(provider->Config().tableName, columns, nullptr)) return -1;
+  uid_t caller = 0;
+  bool known = CallerUid(&caller);
   int rowCount = 0;
   char** rows = nullptr;
   {
-    TableOnlyAuthorizer guard(SurveyHandle(), table->tableName);
-    if (provider->SelectRows(columns, nullptr, nullptr, &rowCount, &rows) != 0) return -1;
+    DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
+    if (!scope.Held()) return -1;
+    // Rendering stops where the result stops fitting the segment; a segment that is not the
+    // caller's takes nothing.
+    scope.LimitResult(known ? SegmentRoom(static_cast<int>(shmId), caller) : 0);
+    if (provider->SelectRows(columns, nullptr, nullptr, &rowCount, &rows) != 0)
+      return scope.ResultTooLarge() ? FALSE : -1;
   }
-  uid_t caller = 0;
-  bool written = CallerUid(&caller) &&
-                 WriteRowsToSegment(static_cast<int>(shmId), caller, rows, rowCount) == 0;
+  bool written = known && WriteRowsToSegment(static_cast<int>(shmId), caller, rows, rowCount) == 0;
   FreeRows(rows, rowCount);
   return written ? TRUE : FALSE;
 }
 
-gboolean logmgr_provider_bus_delete(GObject* self, const char* where, gint* count,
-                                    GError** error) {
+gboolean logmgr_provider_bus_delete(GObject* self, const char* where, gint* count, GError** error) {
   const BusTable* table = TableOf(self);
   if (table == nullptr) return FALSE;
   BaseLogProvider* provider = LookupProvider(table);
@@ -344,8 +344,8 @@ gboolean logmgr_provider_bus_delete(GObject* self, const char* where, gint* coun
   int32_t deleted = 0;
   int result = -1;
   if (where != nullptr && DeleteFits(provider->Config().tableName, where)) {
-    TableOnlyAuthorizer guard(SurveyHandle(), table->tableName);
-    result = provider->DeleteRows(where, &deleted);
+    DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
+    if (scope.Held()) result = provider->DeleteRows(where, &deleted);
   }
   if (result == -1) {
     if (table->deleteFailureIsError) return Fail(table, error, "Delete API Failed");

@@ -30,6 +30,7 @@ ServerUploadLogProvider::ServerUploadLogProvider() {
 int ServerUploadLogProvider::Initialize() {
   DbConnection* conn = UploadConnection();
   if (conn == nullptr) return 0;
+  DbConnection::SetupScope setup(conn);  // the one schema change allowed, and only here
   return conn->Exec(GetCreateTableSql()) == 0 ? 0 : -1;
 }
 

@@ -1,10 +1,15 @@
 #include "db_connection.h"
 
 #include <dlfcn.h>
+#include <errno.h>
+#include <fcntl.h>
 #include <pthread.h>
 #include <sqlite3.h>
 #include <stdio.h>
 #include <string.h>
+#include <sys/stat.h>
+#include <time.h>
+#include <unistd.h>
 
 #include <new>
 #include <string>
@@ -21,8 +26,13 @@ bool g_encryption = false;
 // VM steps between stop-flag checks: small enough that a long scan stops within microseconds.
 const int kProgressSteps = 1000;
 const char kKeyLibrary[] = "/usr/lib/libsqlite3.so.0";
-const int kBusyTimeoutMs = 2000;
-const char kJournalPragmas[] = "PRAGMA journal_mode=WAL; PRAGMA synchronous=NORMAL;";
+// Only the open phase waits for a lock another process holds (a second daemon creating the
+// same tables at its start); the main loop's statements never wait.
+const int kSetupBusyWaitMs = 2000;
+const int kBusyPollMs = 10;
+const char* const kJournalPragmas[] = {"PRAGMA journal_mode=WAL;", "PRAGMA synchronous=NORMAL;"};
+// No value a daemon statement makes comes near this; a bus request cannot build more.
+const int kMaxValueLength = 1 << 20;
 // Rendered cells are cut at these sizes, terminator included.
 const size_t kNumberBuffer = 20;
 const size_t kTextBuffer = 300;
@@ -30,6 +40,21 @@ const size_t kTextBuffer = 300;
 void EnableCancel() {
   int old = 0;
   (void)pthread_setcancelstate(PTHREAD_CANCEL_ENABLE, &old);
+}
+
+int64_t ThreadCpuNs() {
+  struct timespec now;
+  if (clock_gettime(CLOCK_THREAD_CPUTIME_ID, &now) != 0) return 0;
+  return static_cast<int64_t>(now.tv_sec) * 1000000000LL + now.tv_nsec;
+}
+
+// Creates |path| owner-only when it does not exist yet. Not following a link, and exclusive,
+// so an existing file (or anything else at the path) is left to SQLite as it is.
+void CreateOwnerOnly(const char* path) {
+  int fd = open(path, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+  if (fd < 0) return;
+  (void)fchmod(fd, 0600);  // the umask may have taken bits off, never added any
+  (void)close(fd);
 }
 
 void FreeRows(char** rows, int count) {
@@ -83,7 +108,90 @@ bool DbConnection::StopRequestedForThisThread() const {
 // A SQLite callback: it only answers; the thread ends later in the helper's own frame, after
 // the statement is finalised (ending it here would leave the connection mutex held).
 int DbConnection::OnProgress(void* self) {
-  return static_cast<DbConnection*>(self)->StopRequestedForThisThread() ? 1 : 0;
+  DbConnection* conn = static_cast<DbConnection*>(self);
+  if (conn->StopRequestedForThisThread()) return 1;
+  return conn->ScopeOfThisThread() == StatementScope::kBusRequest && conn->BusBudgetSpent() ? 1 : 0;
+}
+
+int DbConnection::OnAuthorize(void* self, int action, const char* arg1, const char* arg2,
+                              const char* dbName, const char*) {
+  DbConnection* conn = static_cast<DbConnection*>(self);
+  StatementScope current = conn->ScopeOfThisThread();
+  return AuthorizeAction(current,
+                         current == StatementScope::kBusRequest ? conn->scopeTable : nullptr,
+                         action, arg1, arg2, dbName);
+}
+
+int DbConnection::OnBusy(void* self, int attempts) {
+  DbConnection* conn = static_cast<DbConnection*>(self);
+  if (conn->ScopeOfThisThread() != StatementScope::kSetup) return 0;
+  if (attempts * kBusyPollMs >= kSetupBusyWaitMs) return 0;
+  (void)usleep(kBusyPollMs * 1000);
+  return 1;
+}
+
+StatementScope DbConnection::ScopeOfThisThread() const {
+  StatementScope current = scope.load(std::memory_order_acquire);
+  if (current == StatementScope::kDaemon) return current;
+  return pthread_equal(scopeThread.load(std::memory_order_acquire), pthread_self())
+             ? current
+             : StatementScope::kDaemon;
+}
+
+bool DbConnection::EnterScope(StatementScope wanted, const char* table) {
+  if (scope.load(std::memory_order_acquire) != StatementScope::kDaemon) return false;
+  scopeTable = table;
+  busCpuDeadlineNs = ThreadCpuNs() + static_cast<int64_t>(busBudgetMs) * 1000000LL;
+  busBudgetSpent = false;
+  resultLimit = SIZE_MAX;
+  resultTooLarge = false;
+  scopeThread.store(pthread_self(), std::memory_order_release);
+  scope.store(wanted, std::memory_order_release);
+  return true;
+}
+
+void DbConnection::LeaveScope() {
+  scope.store(StatementScope::kDaemon, std::memory_order_release);
+  scopeTable = nullptr;
+}
+
+bool DbConnection::BusBudgetSpent() {
+  if (!busBudgetSpent && ThreadCpuNs() > busCpuDeadlineNs) busBudgetSpent = true;
+  return busBudgetSpent;
+}
+
+void DbConnection::EndThreadUnlessBudgetSpent(sqlite3_stmt* stmt) {
+  sqlite3_finalize(stmt);
+  if (ScopeOfThisThread() == StatementScope::kBusRequest && busBudgetSpent &&
+      !StopRequestedForThisThread())
+    return;
+  EndInterruptedThread();
+}
+
+DbConnection::SetupScope::SetupScope(DbConnection* conn) : conn(conn) {
+  if (this->conn != nullptr && !this->conn->EnterScope(StatementScope::kSetup, nullptr))
+    this->conn = nullptr;
+}
+
+DbConnection::SetupScope::~SetupScope() {
+  if (conn != nullptr) conn->LeaveScope();
+}
+
+DbConnection::BusRequestScope::BusRequestScope(DbConnection* conn, const char* table) : conn(conn) {
+  if (this->conn != nullptr && !this->conn->EnterScope(StatementScope::kBusRequest, table))
+    this->conn = nullptr;
+}
+
+DbConnection::BusRequestScope::~BusRequestScope() {
+  if (conn != nullptr) conn->LeaveScope();
+}
+
+void DbConnection::BusRequestScope::LimitResult(size_t bytes) {
+  if (conn != nullptr) conn->resultLimit = bytes;
+}
+
+bool DbConnection::BusRequestScope::ResultTooLarge() const {
+  return conn != nullptr && conn->resultTooLarge;
 }
 
 void DbConnection::BeginStatement() {
@@ -102,6 +210,7 @@ void DbConnection::EndInterruptedThread() {
 int DbConnection::Open(const char* path) {
   if (db != nullptr) return 0;
   if (path == nullptr) return -1;
+  CreateOwnerOnly(path);
   sqlite3* handle = nullptr;
   if (sqlite3_open_v2(path, &handle, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr) !=
       SQLITE_OK) {
@@ -131,33 +240,39 @@ int DbConnection::Open(const char* path) {
       (void)dlclose(dl);
     }
   }
+  db = handle;
+  // Installed once for the life of the handle: each hook reads the calling thread's scope,
+  // so nothing is set per statement (setting an authorizer expires prepared statements).
+  (void)sqlite3_set_authorizer(handle, OnAuthorize, this);
+  (void)sqlite3_busy_handler(handle, OnBusy, this);
+  sqlite3_progress_handler(handle, kProgressSteps, OnProgress, this);
+  (void)sqlite3_limit(handle, SQLITE_LIMIT_LENGTH, kMaxValueLength);
   // WAL with synchronous NORMAL: an event's insert costs no fsync; a power cut may drop the
   // last commits but never corrupts the file. A file that refuses it keeps its journal mode.
-  // Another process (a second daemon, logmgrctl) may hold the file for a moment: wait for it
-  // rather than fail the statement.
-  (void)sqlite3_busy_timeout(handle, kBusyTimeoutMs);
-  (void)sqlite3_exec(handle, kJournalPragmas, nullptr, nullptr, nullptr);
-  sqlite3_progress_handler(handle, kProgressSteps, OnProgress, this);
-  db = handle;
+  SetupScope setup(this);
+  for (const char* pragma : kJournalPragmas) (void)Exec(pragma);
+  EnableCancel();  // a refused pragma leaves the thread as it found it
   return 0;
 }
 
 int DbConnection::Exec(const char* sql) {
   if (sql == nullptr || db == nullptr) return -1;
-  BeginStatement();
-  char* errmsg = nullptr;
-  int rc = sqlite3_exec(db, sql, nullptr, nullptr, &errmsg);
-  if (rc == SQLITE_INTERRUPT) {
-    sqlite3_free(errmsg);
-    EndInterruptedThread();
+  sqlite3_stmt* stmt = nullptr;
+  // Deliberately left non-cancellable after a failed statement, a refused text included.
+  if (!PrepareOrFail(sql, &stmt, false)) return -1;
+  int rc;
+  while ((rc = sqlite3_step(stmt)) == SQLITE_ROW) {
   }
-  if (rc == SQLITE_OK) {
+  if (rc == SQLITE_INTERRUPT) {
+    EndThreadUnlessBudgetSpent(stmt);
+    return -1;
+  }
+  sqlite3_finalize(stmt);
+  if (rc == SQLITE_DONE) {
     EnableCancel();
     return 0;
   }
   (void)sqlite3_extended_errcode(db);
-  sqlite3_free(errmsg);
-  // Deliberately left non-cancellable after a failed statement.
   return -1;
 }
 
@@ -165,13 +280,13 @@ int DbConnection::TableExists(const char* name) {
   if (db == nullptr || name == nullptr) return 0;
   char sql[1024];
   (void)snprintf(sql, sizeof(sql), "select count(*) from sqlite_master where name in ('%s')", name);
-  BeginStatement();
   sqlite3_stmt* stmt = nullptr;
-  (void)sqlite3_prepare_v2(db, sql, -1, &stmt, nullptr);
+  if (!PrepareOrFail(sql, &stmt)) return 0;
   int rc = sqlite3_step(stmt);
   if (rc == SQLITE_INTERRUPT) {
-    sqlite3_finalize(stmt);
-    EndInterruptedThread();
+    EndThreadUnlessBudgetSpent(stmt);
+    EnableCancel();
+    return 0;
   }
   int exists = (rc == SQLITE_ROW && sqlite3_column_int64(stmt, 0) == 1) ? 1 : 0;
   sqlite3_finalize(stmt);
@@ -193,18 +308,21 @@ int64_t DbConnection::MaxTimestamp(const char* table) {
   return ScalarQuery(sql);
 }
 
-bool DbConnection::PrepareOrFail(const char* sql, sqlite3_stmt** stmt) {
+bool DbConnection::PrepareOrFail(const char* sql, sqlite3_stmt** stmt, bool enableCancelOnFailure) {
   BeginStatement();
   *stmt = nullptr;
-  int rc = sqlite3_prepare_v2(db, sql, -1, stmt, nullptr);
+  const char* tail = nullptr;
+  int rc = sqlite3_prepare_v2(db, sql, -1, stmt, &tail);
   if (rc == SQLITE_INTERRUPT) {
     sqlite3_finalize(*stmt);
     EndInterruptedThread();
   }
-  if (rc != SQLITE_OK) {
+  // Exactly one statement: nothing to run is as wrong as a second one to run.
+  if (rc != SQLITE_OK || *stmt == nullptr || !IsOnlyBlanksAndComments(tail)) {
     sqlite3_finalize(*stmt);
+    *stmt = nullptr;
     ReportError();
-    EnableCancel();
+    if (enableCancelOnFailure) EnableCancel();
     return false;
   }
   return true;
@@ -217,8 +335,9 @@ int64_t DbConnection::ScalarQuery(const char* sql) {
   int64_t value = 0;
   while ((rc = sqlite3_step(stmt)) == SQLITE_ROW) value = sqlite3_column_int64(stmt, 0);
   if (rc == SQLITE_INTERRUPT) {
-    sqlite3_finalize(stmt);
-    EndInterruptedThread();
+    EndThreadUnlessBudgetSpent(stmt);
+    EnableCancel();
+    return 0;
   }
   if (rc != SQLITE_DONE) value = 0;
   sqlite3_finalize(stmt);
@@ -229,6 +348,8 @@ int64_t DbConnection::ScalarQuery(const char* sql) {
 int DbConnection::Select(const char* sql, const char* table, int* rowCount, char*** rows) {
   if (sql == nullptr || db == nullptr || rowCount == nullptr || rows == nullptr) return -1;
   int capacity = Count(table);
+  // A count cut short by the bus budget reads as 0; that request has failed, not found nothing.
+  if (ScopeOfThisThread() == StatementScope::kBusRequest && busBudgetSpent) return -1;
   if (capacity <= 0) {
     *rowCount = 0;
     return 0;
@@ -237,6 +358,16 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
   if (!PrepareOrFail(sql, &stmt)) return -1;
   int rc = SQLITE_ROW;
   int columns = sqlite3_column_count(stmt);
+  bool forBus = ScopeOfThisThread() == StatementScope::kBusRequest;
+  // A bus request's result goes into a segment of the caller's choosing: stop as soon as it
+  // cannot fit, never build it whole first.
+  size_t limit = forBus ? resultLimit : SIZE_MAX;
+  size_t used = 1;  // the end mark after the last row
+  if (forBus && columns > kBusMaxColumns) {
+    sqlite3_finalize(stmt);
+    EnableCancel();
+    return -1;
+  }
   char** out = new (std::nothrow) char*[capacity];
   // One scratch row for the whole select: no cell renders longer than kTextBuffer - 1.
   char* scratch = new (std::nothrow) char[static_cast<size_t>(columns) * kTextBuffer + 1];
@@ -249,19 +380,23 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
   }
   *rows = out;
   int index = 0;
+  bool failed = false;
   // The array is sized by the whole table; a query yielding more rows than the table holds
   // is cut there rather than written past the array.
   while (index < capacity && (rc = sqlite3_step(stmt)) == SQLITE_ROW) {
     size_t length = 0;
     for (int c = 0; c < columns; ++c) length += RenderColumn(stmt, c, scratch + length);
+    used += length + 1;
+    if (used > limit) {
+      resultTooLarge = true;
+      failed = true;
+      break;
+    }
     // A row whose columns are all NULL becomes an empty text, so every counted slot is valid.
     char* row = new (std::nothrow) char[length + 1]();
     if (row == nullptr) {
-      delete[] scratch;
-      FreeRows(out, index);
-      sqlite3_finalize(stmt);
-      EnableCancel();
-      return -1;
+      failed = true;
+      break;
     }
     memcpy(row, scratch, length);
     out[index++] = row;
@@ -269,15 +404,21 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
   delete[] scratch;
   if (rc == SQLITE_INTERRUPT) {
     FreeRows(out, index);
-    sqlite3_finalize(stmt);
-    EndInterruptedThread();
+    *rows = nullptr;
+    EndThreadUnlessBudgetSpent(stmt);
+    EnableCancel();
+    return -1;
   }
-  if (index == 0) {
-    delete[] out;
+  // A step that ends in an error (an overflowing SUM, a corrupt page) is a failed select, not
+  // a shorter result.
+  if (!failed && rc != SQLITE_ROW && rc != SQLITE_DONE) failed = true;
+  if (failed || index == 0) {
+    FreeRows(out, index);
     *rows = nullptr;
   }
   sqlite3_finalize(stmt);
   EnableCancel();
+  if (failed) return -1;
   *rowCount = index;
   return 0;
 }

@@ -9,6 +9,7 @@
 
 #include "db_connection.h"
 #include "platform/fixed_path.h"
+#include "sql_literal.h"
 
 namespace _CorvaneLogManager {
 
@@ -117,7 +118,10 @@ int PrefStore::Open() {
   if (connection == nullptr) return -1;
   char path[PATH_MAX];
   if (connection->Open(logmgr_fixed_path(kDbPath, path, sizeof(path))) != 0) return -1;
-  if (connection->Exec(kCreateSql) != 0) return -1;
+  {
+    DbConnection::SetupScope setup(connection);
+    if (connection->Exec(kCreateSql) != 0) return -1;
+  }
   std::string id;
   if (GetString(kDeviceIdKey, &id) != 0) return -1;
   if (id.empty()) {
@@ -130,14 +134,15 @@ int PrefStore::Open() {
 
 int PrefStore::SetString(const char* key, const char* value) {
   if (key == nullptr || key[0] == '\0' || connection == nullptr) return -1;
-  std::string sql = "INSERT OR REPLACE INTO ";
-  sql += kTable;
-  sql += " VALUES('";
-  sql += key;
-  sql += "','";
-  sql += value != nullptr ? value : "";
-  sql += "');";
-  return connection->Exec(sql.c_str());
+  char keyLiteral[512];
+  char valueLiteral[4096];
+  if (QuoteLiteral(keyLiteral, sizeof(keyLiteral), key) != 0 ||
+      QuoteLiteral(valueLiteral, sizeof(valueLiteral), value != nullptr ? value : "") != 0)
+    return -1;
+  char sql[sizeof(keyLiteral) + sizeof(valueLiteral) + 64];
+  (void)snprintf(sql, sizeof(sql), "INSERT OR REPLACE INTO %s VALUES(%s,%s);", kTable, keyLiteral,
+                 valueLiteral);
+  return connection->Exec(sql);
 }
 
 int PrefStore::SetInt64(const char* key, int64_t value) {
@@ -148,9 +153,11 @@ int PrefStore::SetInt64(const char* key, int64_t value) {
 
 int PrefStore::GetString(const char* key, std::string* value) {
   if (key == nullptr || key[0] == '\0' || value == nullptr || connection == nullptr) return -1;
+  char keyLiteral[512];
+  if (QuoteLiteral(keyLiteral, sizeof(keyLiteral), key) != 0) return -1;
   char sql[1024];
-  (void)snprintf(sql, sizeof(sql), "SELECT %s FROM %s WHERE %s='%s';", "pref_data", kTable,
-                 "pref_key", key);
+  (void)snprintf(sql, sizeof(sql), "SELECT %s FROM %s WHERE %s=%s;", "pref_data", kTable,
+                 "pref_key", keyLiteral);
   int count = 0;
   char** rows = nullptr;
   int rc = connection->Select(sql, kTable, &count, &rows);

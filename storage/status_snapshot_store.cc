@@ -9,6 +9,7 @@
 
 #include "db_connection.h"
 #include "platform/fixed_path.h"
+#include "sql_literal.h"
 
 namespace _CorvaneLogManager {
 
@@ -35,6 +36,7 @@ StatusSnapshotStore* StatusSnapshotStore::GetInstance() {
   if (store->connection == nullptr) return nullptr;
   char buf[PATH_MAX];
   if (store->connection->Open(logmgr_fixed_path(kDbPath, buf, sizeof(buf))) != 0) return nullptr;
+  DbConnection::SetupScope setup(store->connection);
   if (store->connection->Exec(kCreateSql) != 0) return nullptr;
   return store;
 }
@@ -53,20 +55,27 @@ StatusSnapshotStore::~StatusSnapshotStore() {
 
 int StatusSnapshotStore::Put(const char* feature, const char* extra, int64_t timestamp) {
   if (feature == nullptr || feature[0] == '\0' || connection == nullptr) return -1;
+  // Stored verbatim: an extra may come from outside the process (a device's name or class).
+  char featureLiteral[256];
+  char extraLiteral[512];
+  if (QuoteLiteral(featureLiteral, sizeof(featureLiteral), feature) != 0 ||
+      QuoteLiteral(extraLiteral, sizeof(extraLiteral), extra != nullptr ? extra : "") != 0)
+    return -1;
   char sql[1024];
-  // Texts go in unescaped: a quote in them breaks the statement, which then fails.
   (void)snprintf(sql, sizeof(sql),
-                 "INSERT OR REPLACE INTO survey_status_monitor VALUES('%s','%s',%lld);", feature,
-                 extra != nullptr ? extra : "", static_cast<long long>(timestamp));
+                 "INSERT OR REPLACE INTO survey_status_monitor VALUES(%s,%s,%lld);", featureLiteral,
+                 extraLiteral, static_cast<long long>(timestamp));
   return connection->Exec(sql) == 0 ? 0 : -1;
 }
 
 int StatusSnapshotStore::Get(const char* feature, std::string* extraOut, int64_t* timestampOut) {
   if (feature == nullptr || feature[0] == '\0' || connection == nullptr) return -1;
+  char featureLiteral[256];
+  if (QuoteLiteral(featureLiteral, sizeof(featureLiteral), feature) != 0) return -1;
   char sql[1024];
   (void)snprintf(sql, sizeof(sql),
-                 "SELECT extra,timestamp FROM survey_status_monitor WHERE feature = '%s';",
-                 feature);
+                 "SELECT extra,timestamp FROM survey_status_monitor WHERE feature = %s;",
+                 featureLiteral);
   int rowCount = 0;
   char** rows = nullptr;
   if (connection->Select(sql, kTable, &rowCount, &rows) != 0) return -1;

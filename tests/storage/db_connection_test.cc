@@ -33,6 +33,11 @@ class DbConnectionTest : public ::testing::Test {
     (void)chmod(dir.c_str(), 0700);
     (void)system(("rm -rf '" + dir + "'").c_str());
   }
+  // Runs each statement in the open phase, the only time tables may be made.
+  void Setup(std::initializer_list<const char*> statements) {
+    DbConnection::SetupScope setup(&conn);
+    for (const char* sql : statements) ASSERT_EQ(conn.Exec(sql), 0) << sql;
+  }
   // A Select's rows as strings, freeing what it handed over; |rc| gets its result.
   Rows Select(const char* sql, const char* table, int* rc = nullptr) {
     int count = -1;
@@ -71,7 +76,7 @@ TEST_F(DbConnectionTest, RendersColumnsAsCommaTerminatedTexts) {
       {"text of 400 cut at 299", "'" + t400 + "', 7, NULL, NULL", t400.substr(0, 299) + "7,"},
       {"widest integer cut at 19", "-9223372036854775808, NULL, NULL, NULL", "-922337203685477580"},
   };
-  ASSERT_EQ(conn.Exec("CREATE TABLE t(id INTEGER PRIMARY KEY, a, b, c, d);"), 0);
+  Setup({"CREATE TABLE t(id INTEGER PRIMARY KEY, a, b, c, d);"});
   for (const Case& c : cases) {
     ASSERT_EQ(conn.Exec(("INSERT INTO t(a, b, c, d) VALUES(" + c.values + ");").c_str()), 0);
   }
@@ -84,10 +89,8 @@ TEST_F(DbConnectionTest, RendersColumnsAsCommaTerminatedTexts) {
 }
 
 TEST_F(DbConnectionTest, SizesSelectByTheNamedTable) {
-  ASSERT_EQ(conn.Exec("CREATE TABLE small(x); INSERT INTO small VALUES(1),(2);"
-                      "CREATE TABLE big(x); INSERT INTO big VALUES(1),(2),(3),(4),(5);"
-                      "CREATE TABLE empty(x);"),
-            0);
+  Setup({"CREATE TABLE small(x);", "INSERT INTO small VALUES(1),(2);", "CREATE TABLE big(x);",
+         "INSERT INTO big VALUES(1),(2),(3),(4),(5);", "CREATE TABLE empty(x);"});
   // More rows than the named table holds are cut, never written past the array.
   EXPECT_EQ(Select("SELECT x FROM big ORDER BY x;", "small"), (Rows{"1,", "2,"}));
   EXPECT_EQ(Select("SELECT x FROM big;", "big").size(), 5u);
@@ -102,7 +105,7 @@ TEST_F(DbConnectionTest, SizesSelectByTheNamedTable) {
 }
 
 TEST_F(DbConnectionTest, CountsAndFailureValues) {
-  ASSERT_EQ(conn.Exec("CREATE TABLE log(id INTEGER PRIMARY KEY, timestamp INTEGER);"), 0);
+  Setup({"CREATE TABLE log(id INTEGER PRIMARY KEY, timestamp INTEGER);"});
   EXPECT_EQ(conn.MaxTimestamp("log"), 0) << "empty table";
   ASSERT_EQ(conn.Exec("INSERT INTO log VALUES(1, 5000000000), (8589934597, 17);"), 0);
   EXPECT_EQ(conn.TableExists("log"), 1);
@@ -134,7 +137,10 @@ TEST_F(DbConnectionTest, BadFilesAndDirectoriesFailWithoutDamage) {
   ASSERT_EQ(system(("head -c 4096 /dev/urandom > '" + junk + "'").c_str()), 0);
   DbConnection bad;
   ASSERT_EQ(bad.Open(junk.c_str()), 0) << "SQLite reads the header lazily";
-  EXPECT_EQ(bad.Exec("CREATE TABLE IF NOT EXISTS t(x);"), -1);
+  {
+    DbConnection::SetupScope setup(&bad);
+    EXPECT_EQ(bad.Exec("CREATE TABLE IF NOT EXISTS t(x);"), -1);
+  }
   EXPECT_EQ(bad.Count("t"), 0);
   EXPECT_EQ(bad.TableExists("t"), 0);
   EXPECT_EQ(bad.Close(), 0);
@@ -143,10 +149,12 @@ TEST_F(DbConnectionTest, BadFilesAndDirectoriesFailWithoutDamage) {
 
   // A read-only directory holding a database with a row: no new file, no write (a WAL file
   // cannot read there either). Root ignores modes, so a child drops to an unprivileged user.
-  ASSERT_EQ(conn.Exec("CREATE TABLE t(x); INSERT INTO t VALUES('kept');"), 0);
+  Setup({"CREATE TABLE t(x);", "INSERT INTO t VALUES('kept');"});
   ASSERT_EQ(conn.Close(), 0);
+  ASSERT_EQ(chmod(path.c_str(), 0644), 0);  // made owner-only; the reader below is another user
   ASSERT_EQ(chmod(dir.c_str(), 0555), 0);
-  ::testing::FLAGS_gtest_death_test_style = "fast";  // a re-executed child would make its own sysroot
+  ::testing::FLAGS_gtest_death_test_style =
+      "fast";  // a re-executed child would make its own sysroot
   EXPECT_EXIT(
       {
         if (geteuid() == 0 && (setgid(65534) != 0 || setuid(65534) != 0)) _exit(10);
@@ -194,7 +202,7 @@ struct Worker {
 };
 
 TEST_F(DbConnectionTest, InterruptEndsTheThreadRunningTheStatement) {
-  ASSERT_EQ(conn.Exec("CREATE TABLE t(x); INSERT INTO t VALUES(1);"), 0);
+  Setup({"CREATE TABLE t(x);", "INSERT INTO t VALUES(1);"});
   ASSERT_EQ(sqlite3_create_function(conn.Handle(), "mark", 0, SQLITE_UTF8, nullptr, Mark, nullptr,
                                     nullptr),
             SQLITE_OK);
@@ -214,7 +222,8 @@ TEST_F(DbConnectionTest, InterruptEndsTheThreadRunningTheStatement) {
     if (c.interruptFirst) {
       conn.Interrupt();
       // The requesting thread's own statements are not stopped.
-      EXPECT_EQ(conn.Exec("INSERT INTO t VALUES(2); DELETE FROM t WHERE x = 2;"), 0);
+      EXPECT_EQ(conn.Exec("INSERT INTO t VALUES(2);"), 0);
+      EXPECT_EQ(conn.Exec("DELETE FROM t WHERE x = 2;"), 0);
     }
     Worker worker{&conn, c.useSelect, endless};
     pthread_t thread;
@@ -233,6 +242,190 @@ TEST_F(DbConnectionTest, InterruptEndsTheThreadRunningTheStatement) {
   }
 }
 
+TEST_F(DbConnectionTest, RunsExactlyOneStatementOrNothing) {
+  Setup({"CREATE TABLE t(x);", "CREATE TABLE other(y);", "INSERT INTO other VALUES('kept');"});
+  const struct {
+    const char* sql;
+    int result;
+  } cases[] = {
+      {"INSERT INTO t VALUES(1);", 0},
+      {"INSERT INTO t VALUES(2); -- a note\n /* and another */ ", 0},
+      {"INSERT INTO t VALUES(3); /* left open", 0},
+      {"INSERT INTO t VALUES(4); DELETE FROM other;", -1},
+      {"INSERT INTO t VALUES(5); INSERT INTO t VALUES(6);", -1},
+      {"DELETE FROM other WHERE 0;; ", -1},
+      {"DELETE FROM other WHERE 0; -- x\n DROP TABLE other", -1},
+      {"", -1},
+      {"-- nothing to run", -1},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.sql);
+    EXPECT_EQ(conn.Exec(c.sql), c.result);
+  }
+  // Refused texts ran no part of themselves.
+  EXPECT_EQ(Select("SELECT x FROM t ORDER BY x;", "t"), (Rows{"1,", "2,", "3,"}));
+  int rc = 0;
+  EXPECT_TRUE(Select("SELECT x FROM t; DELETE FROM other;", "t", &rc).empty());
+  EXPECT_EQ(rc, -1);
+  EXPECT_EQ(Select("SELECT y FROM other;", "other"), Rows{"kept,"});
+}
+
+TEST_F(DbConnectionTest, AfterTheOpenPhaseOnlyRowsChange) {
+  std::string attached = dir + "/attached.db";
+  const char* kNames =
+      "SELECT group_concat(name, ' ') FROM (SELECT name FROM sqlite_master ORDER BY name);";
+  Setup({"CREATE TABLE t(x);", "CREATE TABLE u(y);", "PRAGMA user_version = 1;"});
+  const struct {
+    const char* sql;
+    bool daemon;  // allowed for the daemon's own statements
+    bool setup;   // allowed in the open phase
+  } cases[] = {
+      {"INSERT INTO t VALUES(1);", true, true},
+      {"UPDATE t SET x = x + 1;", true, true},
+      {"PRAGMA user_version;", true, true},
+      {"SELECT count(*) FROM sqlite_master;", true, true},
+      {"BEGIN;", true, true},
+      {"COMMIT;", true, true},
+      {"PRAGMA user_version = 7;", false, true},
+      {"PRAGMA writable_schema = 1;", false, false},
+      {"CREATE TABLE IF NOT EXISTS w(y);", false, true},
+      {"CREATE INDEX IF NOT EXISTS tx ON t(x);", false, true},
+      {"DROP TABLE u;", false, false},
+      {"DROP INDEX tx;", false, false},
+      {"ALTER TABLE t ADD COLUMN z;", false, false},
+      {"CREATE TRIGGER tr AFTER INSERT ON t BEGIN DELETE FROM t; END;", false, false},
+      {"CREATE VIEW v AS SELECT x FROM t;", false, false},
+      {"CREATE TEMP TABLE tt(z);", false, true},
+      {"DELETE FROM sqlite_master;", false, false},
+      {"UPDATE sqlite_master SET sql = 'x';", false, false},
+  };
+  for (bool inSetup : {false, true}) {
+    for (const auto& c : cases) {
+      SCOPED_TRACE(std::string(inSetup ? "setup: " : "daemon: ") + c.sql);
+      if (inSetup) {
+        DbConnection::SetupScope setup(&conn);
+        EXPECT_EQ(conn.Exec(c.sql), c.setup ? 0 : -1);
+      } else {
+        EXPECT_EQ(conn.Exec(c.sql), c.daemon ? 0 : -1);
+      }
+    }
+    if (!inSetup) {
+      EXPECT_EQ(Select("PRAGMA user_version;", "t"), Rows{"1,"});
+      EXPECT_EQ(Select(kNames, "t"), Rows{"t u,"});
+    }
+    // ATTACH is never allowed, and no file appears for it.
+    DbConnection::SetupScope setup(inSetup ? &conn : nullptr);
+    EXPECT_EQ(conn.Exec(("ATTACH DATABASE '" + attached + "' AS a;").c_str()), -1);
+    EXPECT_NE(access(attached.c_str(), F_OK), 0);
+  }
+  EXPECT_EQ(Select(kNames, "t"), Rows{"t tx u w,"});
+}
+
+TEST_F(DbConnectionTest, AStepThatEndsInAnErrorIsAFailure) {
+  Setup({"CREATE TABLE t(id INTEGER PRIMARY KEY, v INTEGER, timestamp INTEGER);",
+         "INSERT INTO t(v, timestamp) VALUES (9223372036854775807, 1), (1, 2), (3, 3);"});
+  int rc = 0;
+  // SUM overflows only when it reaches the second row: the error comes after stepping began.
+  EXPECT_TRUE(Select("SELECT SUM(v) FROM t;", "t", &rc).empty());
+  EXPECT_EQ(rc, -1);
+  // An error on the third row of a plain select loses the first two too: the result fails.
+  EXPECT_TRUE(Select("SELECT CASE WHEN id = 3 THEN abs(-9223372036854775807 - 1) ELSE v END FROM t "
+                     "ORDER BY id;",
+                     "t", &rc)
+                  .empty());
+  EXPECT_EQ(rc, -1);
+  EXPECT_EQ(conn.Exec("UPDATE t SET v = (SELECT SUM(v) FROM t) WHERE id = 2;"), -1);
+  EXPECT_EQ(conn.Exec("INSERT INTO t(v) SELECT abs(-9223372036854775807 - 1);"), -1);
+  EXPECT_EQ(conn.Count("t"), 3);
+  EXPECT_EQ(Select("SELECT v FROM t WHERE id = 2;", "t"), Rows{"1,"}) << "nothing changed";
+}
+
+// A statement on another thread, as the report worker runs one while the main loop serves.
+struct OtherThread {
+  DbConnection* conn;
+  const char* sql;
+  int result = 1;
+  static void* Run(void* arg) {
+    OtherThread* self = static_cast<OtherThread*>(arg);
+    self->result = self->conn->Exec(self->sql);
+    return nullptr;
+  }
+  int Go() {
+    pthread_t thread;
+    if (pthread_create(&thread, nullptr, Run, this) != 0) return 2;
+    pthread_join(thread, nullptr);
+    return result;
+  }
+};
+
+TEST_F(DbConnectionTest, ABusRequestTouchesOneTableWithinItsBudgetAndResultLimit) {
+  Setup({"CREATE TABLE own(a);", "CREATE TABLE other(b);"});
+  ASSERT_EQ(conn.Exec("BEGIN;"), 0);
+  for (int i = 0; i < 200; ++i) ASSERT_EQ(conn.Exec("INSERT INTO own VALUES('row');"), 0);
+  ASSERT_EQ(conn.Exec("COMMIT;"), 0);
+  conn.SetBusCpuBudgetMs(50);
+  {
+    DbConnection::BusRequestScope request(&conn, "own");
+    ASSERT_TRUE(request.Held());
+    EXPECT_EQ(conn.Exec("DELETE FROM own WHERE a = 'none';"), 0);
+    EXPECT_EQ(conn.Exec("INSERT INTO other VALUES(1);"), -1);
+    EXPECT_EQ(conn.Exec("DELETE FROM own WHERE a IN (SELECT b FROM other);"), -1);
+    // The scope is this thread's: the worker's statements meanwhile stay the daemon's own.
+    EXPECT_EQ((OtherThread{&conn, "INSERT INTO other VALUES(2);"}.Go()), 0);
+    DbConnection::SetupScope nested(&conn);  // a second scope is never entered
+    EXPECT_EQ(conn.Exec("CREATE TABLE x(c);"), -1);
+  }
+  {
+    // 200^4 rows to count: far past the budget, so it fails instead of holding the thread.
+    DbConnection::BusRequestScope request(&conn, "own");
+    int rc = 0;
+    EXPECT_TRUE(Select("SELECT count(*) FROM own a, own b, own c, own d;", "own", &rc).empty());
+    EXPECT_EQ(rc, -1);
+    EXPECT_FALSE(request.ResultTooLarge());
+    EXPECT_EQ(conn.Exec("DELETE FROM own WHERE a IN (SELECT a.a FROM own a, own b, own c);"), -1);
+  }
+  EXPECT_EQ(conn.Count("own"), 200) << "the stopped delete changed nothing";
+  // Every row renders as "row," plus a NUL, and one byte ends the result.
+  for (size_t limit : {size_t{6}, size_t{5}, size_t{200 * 5 + 1}, size_t{200 * 5}}) {
+    SCOPED_TRACE(limit);
+    DbConnection::BusRequestScope request(&conn, "own");
+    request.LimitResult(limit);
+    int rc = 0;
+    const char* sql = limit < 10 ? "SELECT a FROM own LIMIT 1;" : "SELECT a FROM own;";
+    bool fits = limit == 6 || limit == 200 * 5 + 1;
+    EXPECT_EQ(Select(sql, "own", &rc).size(), fits ? (limit == 6 ? 1u : 200u) : 0u);
+    EXPECT_EQ(rc, fits ? 0 : -1);
+    EXPECT_EQ(request.ResultTooLarge(), !fits);
+  }
+  std::string columns = "a";
+  for (int i = 1; i <= DbConnection::kBusMaxColumns; ++i) columns += ",a";
+  DbConnection::BusRequestScope request(&conn, "own");
+  int rc = 0;
+  (void)Select(("SELECT " + columns + " FROM own;").c_str(), "own", &rc);
+  EXPECT_EQ(rc, -1) << "one column more than a bus request may name";
+}
+
+TEST_F(DbConnectionTest, NewFilesAreOwnerOnlyWhateverTheUmask) {
+  ASSERT_EQ(conn.Close(), 0);
+  mode_t old = umask(0);
+  std::string fresh = dir + "/fresh.db";
+  DbConnection wide;
+  ASSERT_EQ(wide.Open(fresh.c_str()), 0);
+  umask(old);
+  {
+    DbConnection::SetupScope setup(&wide);
+    ASSERT_EQ(wide.Exec("CREATE TABLE t(x);"), 0);
+  }
+  ASSERT_EQ(wide.Exec("INSERT INTO t VALUES(1);"), 0);
+  for (const char* suffix : {"", "-wal", "-shm"}) {
+    SCOPED_TRACE(suffix);
+    struct stat st;
+    ASSERT_EQ(stat((fresh + suffix).c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 0777, 0600u);
+  }
+  EXPECT_EQ(wide.Close(), 0);
+}
+
 TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   char tmpl[] = "/tmp/logmgr-keyed-XXXXXX";
   ASSERT_NE(mkdtemp(tmpl), nullptr);
@@ -245,7 +438,10 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   DbConnection conn;
   // No key library under the sysroot: the password file is made and the open goes on unkeyed.
   EXPECT_EQ(conn.Open(db.c_str()), 0);
-  EXPECT_EQ(conn.Exec("CREATE TABLE t(x);"), 0);
+  {
+    DbConnection::SetupScope setup(&conn);
+    EXPECT_EQ(conn.Exec("CREATE TABLE t(x);"), 0);
+  }
   EXPECT_EQ(conn.Close(), 0);
   std::string key = ReadKey();
   EXPECT_FALSE(key.empty());

@@ -7,6 +7,7 @@
 #include <sys/stat.h>
 
 #include <string>
+
 #include "temp_sysroot.h"
 
 namespace _CorvaneLogManager {
@@ -14,9 +15,7 @@ namespace {
 
 class StatusSnapshotStoreTest : public ::testing::Test {
  protected:
-  void TearDown() override {
-    StatusSnapshotStore::DestroyInstance();
-  }
+  void TearDown() override { StatusSnapshotStore::DestroyInstance(); }
   StatusSnapshotStore* Open() {
     std::string dir = sysroot + "/opt/usr/dbspace";
     (void)system(("mkdir -p '" + dir + "'").c_str());
@@ -86,8 +85,11 @@ TEST_F(StatusSnapshotStoreTest, RejectsWhatTheStatementCannotCarry) {
   EXPECT_EQ(store->Get("", &extra, &ts), -1);
   EXPECT_EQ(extra, "kept");
   EXPECT_EQ(ts, 7);
-  EXPECT_EQ(store->Put("HEAD", "it's", 99), -1);  // the quote breaks the statement
-  EXPECT_EQ(Dump(), "HEAD||42;");
+  // A quote is stored as it came; a feature or extra too long for its literal is refused.
+  EXPECT_EQ(store->Put("HEAD", "it's'); DROP TABLE survey_status_monitor; --", 99), 0);
+  EXPECT_EQ(Dump(), "HEAD|it's'); DROP TABLE survey_status_monitor; --|99;");
+  EXPECT_EQ(store->Put("HEAD", std::string(600, 'x').c_str(), 1), -1);
+  ASSERT_EQ(store->Put("HEAD", "", 42), 0);
 
   // No escaping: an extra with a comma reads back cut, the next field as the timestamp.
   ASSERT_EQ(store->Put("CHAR", "U,12,x", 500), 0);
