@@ -10,6 +10,7 @@
 #include <sys/time.h>
 
 #include "base_log_provider.h"
+#include "collectors/row_values.h"
 #include "provider_registry.h"
 
 namespace _CorvaneLogManager {
@@ -77,8 +78,10 @@ AppUsageMonitor::~AppUsageMonitor() {
 void AppUsageMonitor::SetClock(Clock clock) { g_clock = clock != nullptr ? clock : SystemNowMs; }
 
 int AppUsageMonitor::Start() {
+  if (listening) return 0;  // a retried start registers once
   if (aul_listen_app_launch_signal(LaunchHandler, this) != AUL_R_OK) return -1;
   if (aul_listen_app_dead_signal(DeadHandler, this) != AUL_R_OK) return -1;
+  listening = true;
   return 0;
 }
 
@@ -166,10 +169,10 @@ int AppUsageMonitor::Record(int32_t pid) {
   // A period of -1 (untracked foreground) lands far above the bound and is dropped here.
   int64_t duration = g_clock() - g_periodStart;
   if (duration < 1 || duration > kMaxPeriodMs) return -1;
-  char values[512];
-  memset(values, 0, sizeof(values));
-  (void)snprintf(values, sizeof(values), "'%s',%lld", tracked[pid].c_str(),
-                 static_cast<long long>(duration));
+  char buffer[512];
+  const char* values =
+      RowValues(buffer, sizeof(buffer)).Text(tracked[pid].c_str()).Number(duration).Get();
+  if (values == nullptr) return -1;
   return provider->InsertRow("app_id,duration", values);
 }
 

@@ -38,6 +38,7 @@ class AppUsageMonitor {
   std::map<int32_t, std::string> tracked;
   std::string currentName;
   int32_t currentPid;
+  bool listening = false;
 };
 
 }  // namespace _CorvaneLogManager

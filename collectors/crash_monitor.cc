@@ -8,6 +8,8 @@
 #include <string.h>
 
 #include "base_log_provider.h"
+#include "collectors/row_values.h"
+#include "collectors/trusted_sender.h"
 #include "provider_registry.h"
 
 namespace _CorvaneLogManager {
@@ -26,11 +28,13 @@ int RecordApp(const pkgmgrinfo_appinfo_h handle, void* userData) {
   BaseLogProvider* provider =
       registry != nullptr ? registry->Lookup("report_app_error_survey") : nullptr;
   if (provider != nullptr && appId != nullptr) {
-    char values[512];
-    memset(values, 0, sizeof(values));
-    (void)snprintf(values, sizeof(values), "'%s',%d", appId,
-                   static_cast<int>(reinterpret_cast<intptr_t>(userData)));
-    (void)provider->InsertRow("app_id,type", values);
+    char buffer[512];
+    const char* values = RowValues(buffer, sizeof(buffer))
+                             .Text(appId)
+                             .Number(static_cast<int>(reinterpret_cast<intptr_t>(userData)))
+                             .Get();
+    // An id too long to store whole is not stored at all.
+    if (values != nullptr) (void)provider->InsertRow("app_id,type", values);
   }
   return 0;  // every application sharing the executable gets its row
 }
@@ -48,6 +52,9 @@ void RecordAppsOfExecutable(const char* exePath, int errorType) {
 }  // namespace
 
 int CrashMonitor::Start() {
+  // Already watching: a retried start must not add the filter again (each crash would then
+  // be written once per filter).
+  if (bus != nullptr) return 0;
   DBusError err;
   dbus_error_init(&err);
   DBusConnection* connection = dbus_bus_get(DBUS_BUS_SYSTEM, &err);
@@ -60,30 +67,29 @@ int CrashMonitor::Start() {
   dbus_bus_add_match(connection, kCrashRule, &err);
   if (dbus_error_is_set(&err)) {
     dbus_error_free(&err);
+    dbus_connection_unref(connection);
     return -1;
   }
-  return dbus_connection_add_filter(connection, CrashFilter, this, nullptr) ? 0 : -1;
-}
-
-int CrashMonitor::Stop() {
-  DBusError err;
-  dbus_error_init(&err);
-  DBusConnection* connection = dbus_bus_get(DBUS_BUS_SYSTEM, &err);
-  if (dbus_error_is_set(&err)) {
-    dbus_error_free(&err);
-    return 0;
+  if (!dbus_connection_add_filter(connection, CrashFilter, this, nullptr)) {
+    dbus_bus_remove_match(connection, kCrashRule, nullptr);
+    dbus_connection_unref(connection);
+    return -1;
   }
-  dbus_bus_remove_match(connection, kCrashRule, &err);
-  if (dbus_error_is_set(&err)) {
-    dbus_error_free(&err);
-  } else {
-    dbus_connection_remove_filter(connection, CrashFilter, this);
-  }
-  dbus_connection_unref(connection);
+  bus = connection;
   return 0;
 }
 
-DBusHandlerResult CrashMonitor::CrashFilter(DBusConnection*, DBusMessage* message, void*) {
+int CrashMonitor::Stop() {
+  if (bus == nullptr) return 0;
+  dbus_bus_remove_match(bus, kCrashRule, nullptr);
+  dbus_connection_remove_filter(bus, CrashFilter, this);
+  dbus_connection_unref(bus);
+  bus = nullptr;
+  return 0;
+}
+
+DBusHandlerResult CrashMonitor::CrashFilter(DBusConnection* connection, DBusMessage* message,
+                                            void*) {
   if (!dbus_message_is_signal(message, kCrashInterface, "ProcessCrashed"))
     return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
   DBusError err;
@@ -95,7 +101,8 @@ DBusHandlerResult CrashMonitor::CrashFilter(DBusConnection*, DBusMessage* messag
     dbus_error_free(&err);
     return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
   }
-  RecordAppsOfExecutable(exePath, kErrorTypeCrash);
+  // Only the platform's crash service may report crashes.
+  if (IsTrustedSender(connection, message)) RecordAppsOfExecutable(exePath, kErrorTypeCrash);
   // Other filters on the shared connection still see the signal.
   return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
 }

@@ -14,6 +14,10 @@ class CrashMonitor {
 
   static DBusHandlerResult CrashFilter(DBusConnection* connection, DBusMessage* message,
                                        void* userData);
+
+ private:
+  // The system bus while the filter is installed; null otherwise.
+  DBusConnection* bus = nullptr;
 };
 
 }  // namespace _CorvaneLogManager

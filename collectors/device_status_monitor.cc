@@ -14,6 +14,8 @@
 
 #include "base_log_provider.h"
 #include "collectors/app_usage_monitor.h"
+#include "collectors/row_values.h"
+#include "collectors/trusted_sender.h"
 #include "db_connection.h"
 #include "log_manager.h"
 #include "provider_registry.h"
@@ -59,6 +61,18 @@ const char* AppId() { return LogManager::GetInstance()->GetName().c_str(); }
 BaseLogProvider* FeatureProvider() {
   ProviderRegistry* registry = ProviderRegistry::GetInstance();
   return registry != nullptr ? registry->Lookup(kFeatureTable) : nullptr;
+}
+
+// One feature row; |value| is null for the events that carry none. Texts are stored verbatim.
+int InsertFeatureRow(BaseLogProvider* provider, const char* code, const char* extra,
+                     const long long* value) {
+  if (provider == nullptr) return -1;
+  char buffer[512];
+  RowValues row(buffer, sizeof(buffer));
+  row.Text(AppId()).Text(code).Text(extra);
+  if (value != nullptr) row.Number(*value);
+  if (row.Get() == nullptr) return -1;
+  return provider->InsertRow(value != nullptr ? kPeriodColumns : kEventColumns, row.Get());
 }
 
 // --- vconf ---------------------------------------------------------------------------------
@@ -137,11 +151,12 @@ void OnKeyChanged(keynode_t* node, void* data) {
 
 // --- D-Bus and Bluetooth -------------------------------------------------------------------
 
-DBusHandlerResult OnBusMessage(DBusConnection*, DBusMessage* message, void* data) {
+DBusHandlerResult OnBusMessage(DBusConnection* connection, DBusMessage* message, void* data) {
   DeviceStatusMonitor* monitor = static_cast<DeviceStatusMonitor*>(data);
   // Signals carrying other arguments than announced are not the platform's: skip them.
   if (dbus_message_is_signal(message, kMovementIface, "wakeup")) {
-    // A movement wake-up is deliberately counted as an unlock.
+    // A movement wake-up is deliberately counted as an unlock. Anyone may send it: it is
+    // addressed to us and only marks the device as picked up.
     if (dbus_message_has_signature(message, "")) (void)monitor->RecordUnlock();
   } else if (dbus_message_is_signal(message, kStatusIface, "status_message") &&
              dbus_message_has_signature(message, "s")) {
@@ -149,7 +164,10 @@ DBusHandlerResult OnBusMessage(DBusConnection*, DBusMessage* message, void* data
     DBusError error;
     dbus_error_init(&error);
     if (dbus_message_get_args(message, &error, DBUS_TYPE_STRING, &text, DBUS_TYPE_INVALID)) {
-      if (text != nullptr && strcmp(text, kCaptureText) == 0) (void)monitor->RecordCapture();
+      // Only the platform's notification service reports captures.
+      if (text != nullptr && strcmp(text, kCaptureText) == 0 &&
+          IsTrustedSender(connection, message))
+        (void)monitor->RecordCapture();
     } else {
       dbus_error_free(&error);
     }
@@ -193,10 +211,8 @@ int DeviceStatusMonitor::EndFeature(const char* code, int64_t endTime) {
   if (started <= 0) return 0;
   int64_t duration = endTime - started;
   if (duration >= 1 && duration <= kMaxPeriodMs) {
-    char values[512] = {0};
-    (void)snprintf(values, sizeof(values), "'%s','%s','%s',%lld", AppId(), code, extra.c_str(),
-                   static_cast<long long>(duration));
-    (void)provider->InsertRow(kPeriodColumns, values);
+    long long value = duration;
+    (void)InsertFeatureRow(provider, code, extra.c_str(), &value);
   }
   // Written or discarded as implausible, the period is over.
   return snapshots->Put(code, "", 0) == 0 ? 0 : -1;
@@ -211,34 +227,22 @@ int DeviceStatusMonitor::RecordChargeState(int connected) {
     if (vconf_get_int("memory/sysman/usb_status", &usb) != 0) return -1;
     g_chargeKind = usb == 2 ? "U" : "A";
     (void)StartFeature("CHAR", g_chargeKind);
-    if (provider != nullptr) {
-      char values[512] = {0};
-      (void)snprintf(values, sizeof(values), "'%s','%s','%s',%d", AppId(), "BAT1", g_chargeKind,
-                     percent * 1000);
-      (void)provider->InsertRow(kPeriodColumns, values);
-    }
+    long long level = percent * 1000LL;
+    (void)InsertFeatureRow(provider, "BAT1", g_chargeKind, &level);
     return 0;
   }
   (void)EndFeature("CHAR", NowMs());
   int percent = 0;
   if (device_battery_get_percent(&percent) != DEVICE_ERROR_NONE) return -1;
   if (g_chargeKind == nullptr) return -1;  // no BAT2 without a seen start
-  if (provider != nullptr) {
-    char values[512] = {0};
-    (void)snprintf(values, sizeof(values), "'%s','%s','%s',%d", AppId(), "BAT2", g_chargeKind,
-                   percent * 1000);
-    (void)provider->InsertRow(kPeriodColumns, values);
-  }
+  long long level = percent * 1000LL;
+  (void)InsertFeatureRow(provider, "BAT2", g_chargeKind, &level);
   g_chargeKind = nullptr;
   return 0;
 }
 
 int DeviceStatusMonitor::WriteEvent(const char* code) {
-  BaseLogProvider* provider = FeatureProvider();
-  if (provider == nullptr) return -1;
-  char values[512] = {0};
-  (void)snprintf(values, sizeof(values), "'%s','%s','%s'", AppId(), code, "");
-  return provider->InsertRow(kEventColumns, values) == 0 ? 0 : -1;
+  return InsertFeatureRow(FeatureProvider(), code, "", nullptr) == 0 ? 0 : -1;
 }
 
 int DeviceStatusMonitor::RecordUnlock() { return WriteEvent("UNLO"); }
@@ -254,26 +258,39 @@ int DeviceStatusMonitor::SetScreenState(int on) {
 // --- lifecycle -----------------------------------------------------------------------------
 
 int DeviceStatusMonitor::Start() {
-  for (const KeyWatch& w : kEarlyKeys) (void)vconf_notify_key_changed(w.key, OnKeyChanged, this);
+  // A retried start resumes: nothing already registered is registered again.
+  if (started) return 0;
+  if (!earlyKeysWatched) {
+    for (const KeyWatch& w : kEarlyKeys) (void)vconf_notify_key_changed(w.key, OnKeyChanged, this);
+    earlyKeysWatched = true;
+  }
 
-  DBusError error;
-  dbus_error_init(&error);
-  g_bus = dbus_bus_get(DBUS_BUS_SYSTEM, &error);
-  if (g_bus == nullptr || dbus_error_is_set(&error)) {
-    dbus_error_free(&error);
-    g_bus = nullptr;
-    return -1;
+  if (g_bus == nullptr) {
+    DBusError error;
+    dbus_error_init(&error);
+    DBusConnection* bus = dbus_bus_get(DBUS_BUS_SYSTEM, &error);
+    if (bus == nullptr || dbus_error_is_set(&error)) {
+      dbus_error_free(&error);
+      return -1;
+    }
+    dbus_connection_setup_with_g_main(bus, nullptr);
+    // No rule for the movement interface: its wake-up is sent straight to us.
+    dbus_bus_add_match(bus, kStatusMatch, &error);
+    if (dbus_error_is_set(&error)) {
+      dbus_error_free(&error);
+      dbus_connection_unref(bus);
+      return -1;
+    }
+    if (!dbus_connection_add_filter(bus, OnBusMessage, this, nullptr)) {
+      dbus_bus_remove_match(bus, kStatusMatch, nullptr);
+      dbus_connection_unref(bus);
+      return -1;
+    }
+    g_bus = bus;
   }
-  dbus_connection_setup_with_g_main(g_bus, nullptr);
-  // No rule for the movement interface: its wake-up is sent straight to us.
-  dbus_bus_add_match(g_bus, kStatusMatch, &error);
-  if (dbus_error_is_set(&error)) {
-    dbus_error_free(&error);
-    return -1;
-  }
-  if (!dbus_connection_add_filter(g_bus, OnBusMessage, this, nullptr)) return -1;
 
   for (const KeyWatch& w : kLateKeys) (void)vconf_notify_key_changed(w.key, OnKeyChanged, this);
+  started = true;
 
   // Without Bluetooth the other features still count: not a start failure.
   if (bt_initialize() < 0) return 0;
@@ -283,6 +300,8 @@ int DeviceStatusMonitor::Start() {
 }
 
 int DeviceStatusMonitor::Stop() {
+  started = false;
+  earlyKeysWatched = false;
   for (const KeyWatch& w : kEarlyKeys) (void)vconf_ignore_key_changed(w.key, OnKeyChanged);
   for (const KeyWatch& w : kLateKeys) (void)vconf_ignore_key_changed(w.key, OnKeyChanged);
   if (g_bus != nullptr) {
@@ -298,6 +317,14 @@ int DeviceStatusMonitor::Stop() {
 }
 
 int DeviceStatusMonitor::Recover() {
+  // Once per run: a second pass would close the periods the first one opened.
+  if (recovered) return 0;
+  if (RecoverAndSample() != 0) return -1;
+  recovered = true;
+  return 0;
+}
+
+int DeviceStatusMonitor::RecoverAndSample() {
   snapshots = StatusSnapshotStore::GetInstance();
   if (snapshots == nullptr) return -1;
   PrefStore* prefs = LogManager::GetInstance()->GetPrefStore();

@@ -30,9 +30,13 @@ class DeviceStatusMonitor {
 
  private:
   int WriteEvent(const char* code);
+  int RecoverAndSample();
 
   AppUsageMonitor* appUsage = nullptr;
   StatusSnapshotStore* snapshots = nullptr;
+  bool recovered = false;
+  bool earlyKeysWatched = false;
+  bool started = false;
 };
 
 }  // namespace _CorvaneLogManager

@@ -5,6 +5,7 @@
 #include <string.h>
 
 #include "base_log_provider.h"
+#include "collectors/row_values.h"
 #include "provider_registry.h"
 
 namespace _CorvaneLogManager {
@@ -23,6 +24,9 @@ PackageMonitor::PackageMonitor() : client(nullptr), pendingType(-1) {
 PackageMonitor::~PackageMonitor() { (void)Stop(); }
 
 int PackageMonitor::Start() {
+  if (listening) return 0;  // a retried start listens once
+  // A client given up by a failed listen is made anew, so that a retry can listen again.
+  if (client == nullptr) client = pkgmgr_client_new(PC_LISTENING);
   (void)pkgmgr_client_set_status_type(client, kStatusTypes);
   int result = pkgmgr_client_listen_status(client, StatusHandler, this);
   if (result < 0) {
@@ -30,12 +34,14 @@ int PackageMonitor::Start() {
     client = nullptr;
     return result;
   }
+  listening = true;
   return 0;
 }
 
 int PackageMonitor::Stop() {
   if (client != nullptr) (void)pkgmgr_client_free(client);
   client = nullptr;
+  listening = false;
   return 0;
 }
 
@@ -65,9 +71,11 @@ int PackageMonitor::Record(const char* packageId) {
   ProviderRegistry* registry = ProviderRegistry::GetInstance();
   BaseLogProvider* provider = registry != nullptr ? registry->Lookup("manage_app_survey") : nullptr;
   if (provider == nullptr) return -1;
-  // A long package id is cut to fit, type and all; the row is still written.
-  char values[132];
-  (void)snprintf(values, sizeof(values), "'%s',%d", packageId, pendingType);
+  // The package id comes from whoever sent the status: stored verbatim, or refused when it
+  // does not fit whole.
+  char buffer[132];
+  const char* values = RowValues(buffer, sizeof(buffer)).Text(packageId).Number(pendingType).Get();
+  if (values == nullptr) return -1;
   return provider->InsertRow("installed_app_id,type", values) != 0 ? -1 : 0;
 }
 

@@ -26,6 +26,7 @@ class PackageMonitor {
   // Kind announced by the last "start" and not yet recorded: 0 install, 1 uninstall,
   // 2 update, -1 none.
   int32_t pendingType;
+  bool listening = false;
 };
 
 }  // namespace _CorvaneLogManager

@@ -9,6 +9,7 @@
 #include <unistd.h>
 #include <vconf.h>
 
+#include "collectors/trusted_sender.h"
 #include "log_manager.h"
 #include "main_loop_glib.h"
 #include "reporting/report_scheduler.h"
@@ -20,8 +21,15 @@ namespace {
 const char kConsentKey[] = "db/setting/report_diagnostic_info";
 const char kPowerOffRule[] = "type='signal',interface='org.tizen.system.deviced.PowerOff'";
 
+// A failed start is tried again after this pause, doubled on every failure up to the cap:
+// prompt for a person fixing the obstacle, cheap for the battery while it stays.
+const double kFirstRetryDelay = 0.01;
+const double kMaxRetryDelay = 1.0;
+
 // Set by the power-off filter and the exit-signal handler so the shutdown runs once.
 bool g_shutdownLatch = false;
+bool g_consentWatched = false;
+double g_retryDelay = kFirstRetryDelay;
 
 [[noreturn]] void Shutdown();
 
@@ -37,18 +45,32 @@ void OnConsentChanged(keynode_t*, void* data) {
   Shutdown();
 }
 
-Eina_Bool OnStartIdle(void* data) {
-  auto* instance = static_cast<LogManager*>(data);
-  // Retried at every idle until the start succeeds; each retry watches consent again.
-  if (vconf_notify_key_changed(kConsentKey, OnConsentChanged, instance) != 0) return 255;
-  if (instance == nullptr) return 255;
-  return instance->Init() != 0 ? 255 : 0;
+Eina_Bool OnStartIdle(void* data);
+
+Eina_Bool OnRetryTimer(void* data) {
+  (void)ecore_idler_add(OnStartIdle, data);
+  return ECORE_CALLBACK_CANCEL;
 }
 
-DBusHandlerResult OnPowerOffFilter(DBusConnection*, DBusMessage* message, void*) {
-  // Every ChangeState ends the daemon, whatever state it announces.
+// Tried until the start succeeds; each retry resumes where the last one stopped.
+Eina_Bool OnStartIdle(void* data) {
+  auto* instance = static_cast<LogManager*>(data);
+  bool started = false;
+  if (!g_consentWatched)
+    g_consentWatched = vconf_notify_key_changed(kConsentKey, OnConsentChanged, instance) == 0;
+  if (g_consentWatched && instance != nullptr) started = instance->Init() == 0;
+  if (started) return ECORE_CALLBACK_CANCEL;
+  // Without a timer the idler stays, which retries at every idle turn instead.
+  if (ecore_timer_add(g_retryDelay, OnRetryTimer, instance) == nullptr) return ECORE_CALLBACK_RENEW;
+  g_retryDelay = g_retryDelay * 2 < kMaxRetryDelay ? g_retryDelay * 2 : kMaxRetryDelay;
+  return ECORE_CALLBACK_CANCEL;
+}
+
+DBusHandlerResult OnPowerOffFilter(DBusConnection* connection, DBusMessage* message, void*) {
+  // Every ChangeState ends the daemon, whatever state it announces, but only when the
+  // platform sent it: a stop on anyone's word would exit 0 and never be restarted.
   if (dbus_message_is_signal(message, "org.tizen.system.deviced.PowerOff", "ChangeState") &&
-      !g_shutdownLatch) {
+      !g_shutdownLatch && IsTrustedSender(connection, message)) {
     g_shutdownLatch = true;
     Shutdown();
   }
@@ -96,10 +118,16 @@ void WatchPowerOff() {
   }
 }
 
+// The daemon writes no diagnostics: EFL's own log (with its backtrace banners when a module
+// cannot reach the bus) goes nowhere, and the exit status tells how a start ended.
+void QuietLog(const Eina_Log_Domain*, Eina_Log_Level, const char*, const char*, int, const char*,
+              void*, va_list) {}
+
 }  // namespace
 
 int RunDaemon() {
   int consent = -1;
+  eina_log_print_cb_set(QuietLog, nullptr);
   if (ecore_init() == 0) return -1;
   (void)logmgr_main_loop_glib_integrate();
   G_GNUC_BEGIN_IGNORE_DEPRECATIONS

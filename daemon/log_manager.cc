@@ -71,16 +71,24 @@ void LogManager::ReleaseMonitors() {
 }
 
 int LogManager::Init() {
-  // Nothing is undone on failure: the start idler retries, and every step tolerates a rerun.
+  // Nothing is undone on failure: the start idler retries, and a retry resumes. Storage steps
+  // that succeeded are skipped and the monitors' starts skip what they registered, so no
+  // provider, bus object, filter or watch is made twice however often the start fails.
+  if (initialised) return 0;
   registry = ProviderRegistry::GetInstance();
   if (registry == nullptr) return -1;
   dbManager = DbManager::GetInstance();
   if (dbManager == nullptr) return -1;
   uploadDbManager = UploadDbManager::GetInstance();
   if (uploadDbManager == nullptr) return -1;
-  if (registry->CreateProviders() != 0) return -1;
-  if (dbManager->Init() != 0) return -1;
-  if (uploadDbManager->Init() != 0) return -1;
+  int (*const storageSteps[])(LogManager*) = {
+      [](LogManager* m) { return m->registry->CreateProviders(); },
+      [](LogManager* m) { return m->dbManager->Init(); },
+      [](LogManager* m) { return m->uploadDbManager->Init(); },
+  };
+  for (; storageStepsDone < 3; ++storageStepsDone) {
+    if (storageSteps[storageStepsDone](this) != 0) return -1;
+  }
   SetRuntimeSwitch(0, true);
   SetRuntimeSwitch(1, true);
   SetName();
@@ -112,7 +120,8 @@ void LogManager::Stop() {
   struct timeval tv;
   gettimeofday(&tv, nullptr);
   long long nowMs = static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-  if (prefStore != nullptr) (void)prefStore->SetLastShutdownTime(static_cast<int32_t>(nowMs / 1000));
+  if (prefStore != nullptr)
+    (void)prefStore->SetLastShutdownTime(static_cast<int32_t>(nowMs / 1000));
 
   if (dbManager != nullptr) DbManager::CloseInstance();
   if (uploadDbManager != nullptr) UploadDbManager::CloseInstance();
@@ -138,6 +147,7 @@ void LogManager::Stop() {
   registry = nullptr;
   dbManager = nullptr;
   uploadDbManager = nullptr;
+  storageStepsDone = 0;
 }
 
 void LogManager::SetName() { name = "com.corvane.logmanager"; }

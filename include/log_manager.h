@@ -55,6 +55,8 @@ class LogManager {
   UploadDbManager* uploadDbManager = nullptr;
   std::string name;
   bool initialised = false;
+  // Leading start steps (providers, survey database, upload database) that have succeeded.
+  int storageStepsDone = 0;
 };
 
 }  // namespace _CorvaneLogManager

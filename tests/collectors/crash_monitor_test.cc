@@ -2,17 +2,43 @@
 #include "collectors/crash_monitor.h"
 
 #include "app_db_test_env.h"
+#include "collectors/trusted_sender.h"
 
 namespace _CorvaneLogManager {
 namespace {
 
+// Senders as the bus would name them: the crash service runs as root, an app as nobody.
+int FakeUidLookup(DBusConnection*, const char* sender, uid_t* uid) {
+  if (strcmp(sender, ":1.7") == 0) {
+    *uid = 0;
+    return 0;
+  }
+  if (strcmp(sender, ":1.9") == 0) {
+    *uid = 65534;
+    return 0;
+  }
+  return -1;
+}
+
 class CrashMonitorTest : public AppDbTest {
  protected:
+  void SetUp() override {
+    AppDbTest::SetUp();
+    SetSenderUidLookup(FakeUidLookup);
+  }
+  void TearDown() override {
+    SetSenderUidLookup(nullptr);
+    AppDbTest::TearDown();
+  }
   // Passes a signal through the filter, which must always leave it to the next filter.
   void Deliver(const char* interface, const char* member, int type1, const void* arg1,
-               int type2 = DBUS_TYPE_INVALID, const void* arg2 = nullptr) {
+               int type2 = DBUS_TYPE_INVALID, const void* arg2 = nullptr,
+               const char* sender = ":1.7") {
     DBusMessage* msg = dbus_message_new_signal("/Org/Tizen/System/Crash/Crash", interface, member);
     ASSERT_NE(msg, nullptr);
+    if (sender != nullptr) {
+      ASSERT_TRUE(dbus_message_set_sender(msg, sender));
+    }
     if (type1 != DBUS_TYPE_INVALID) {
       ASSERT_TRUE(dbus_message_append_args(msg, type1, arg1, type2, arg2, DBUS_TYPE_INVALID));
     }
@@ -20,9 +46,9 @@ class CrashMonitorTest : public AppDbTest {
               DBUS_HANDLER_RESULT_NOT_YET_HANDLED);
     dbus_message_unref(msg);
   }
-  void Crash(const char* exe) {
+  void Crash(const char* exe, const char* sender = ":1.7") {
     const char* name = "proc";
-    Deliver(kIface, "ProcessCrashed", DBUS_TYPE_STRING, &name, DBUS_TYPE_STRING, &exe);
+    Deliver(kIface, "ProcessCrashed", DBUS_TYPE_STRING, &name, DBUS_TYPE_STRING, &exe, sender);
   }
   std::string Errors() {
     return Rows("SELECT app_id, type FROM report_app_error_survey ORDER BY _id");
@@ -53,16 +79,31 @@ TEST_F(CrashMonitorTest, IgnoresOtherSignalsAndUnreadableAppData) {
   EXPECT_EQ(Errors(), "");
 }
 
-TEST_F(CrashMonitorTest, CutsALongAppIdToTheValuesBuffer) {
-  // "'id',1" fits the 512-byte text up to a 507-character id; one more and the cut takes the
-  // type, which leaves a statement the database refuses.
-  for (size_t length : {507u, 508u}) {
-    SCOPED_TRACE(length);
-    std::string exe = "/usr/apps/long" + std::to_string(length);
-    Install(std::string(length, 'a'), "pkg.long", exe);
+TEST_F(CrashMonitorTest, OnlyCrashesReportedByATrustedSenderAreWritten) {
+  Install("com.ex.app", "pkg.app", "/usr/apps/app/bin/app");
+  const char* const untrusted[] = {":1.9", ":1.404", "com.example.name", nullptr};
+  for (const char* sender : untrusted) {
+    SCOPED_TRACE(sender != nullptr ? sender : "no sender");
+    Crash("/usr/apps/app/bin/app", sender);
+  }
+  EXPECT_EQ(Errors(), "");
+  Crash("/usr/apps/app/bin/app");
+  EXPECT_EQ(Errors(), "com.ex.app:1;");
+}
+
+TEST_F(CrashMonitorTest, StoresAppIdsVerbatimAndRefusesOnesThatDoNotFit) {
+  // "'id',1" fits the 512-byte text up to a 507-character id; a quote takes two bytes.
+  const std::string quoted = "com.ex.o'x',9); DROP TABLE report_app_error_survey; --";
+  const std::string fits(507, 'a'), tooLong(508, 'b'), quotedTooLong = std::string(506, 'c') + "'";
+  for (const std::string& id : {quoted, fits, tooLong, quotedTooLong}) {
+    SCOPED_TRACE(id.size());
+    std::string exe = "/usr/apps/x" + std::to_string(id.size()) + id.substr(0, 1);
+    std::string forFixture;  // the fixture's own statement needs the quotes doubled
+    for (char c : id) forFixture += c == '\'' ? "''" : std::string(1, c);
+    Install(forFixture, "pkg.x", exe);
     Crash(exe.c_str());
   }
-  EXPECT_EQ(Errors(), std::string(507, 'a') + ":1;");
+  EXPECT_EQ(Errors(), quoted + ":1;" + fits + ":1;");
 }
 
 }  // namespace

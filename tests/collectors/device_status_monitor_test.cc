@@ -106,5 +106,14 @@ TEST_F(DeviceStatusMonitorTest, FirstStartWinsAndClosingTwiceWritesOnce) {
   EXPECT_EQ(fresh.EndFeature("HEAD", start), -1);
 }
 
+TEST_F(DeviceStatusMonitorTest, ARetriedStartDoesNotRecoverAgain) {
+  // A retried daemon start runs recovery again; the periods opened since must stay open.
+  ASSERT_EQ(monitor.StartFeature("WIFI", ""), 0);
+  int64_t opened = OpenedAt("WIFI");
+  ASSERT_EQ(monitor.Recover(), 0);
+  EXPECT_EQ(OpenedAt("WIFI"), opened);
+  EXPECT_EQ(Rows(), "");
+}
+
 }  // namespace
 }  // namespace _CorvaneLogManager

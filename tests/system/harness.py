@@ -4,6 +4,7 @@ A Device has its own private system bus (and Xvfb when asked), runs the real log
 real tools from the build directory, and offers polling waits. Nothing reaches into the daemon:
 tests drive it with vconftool, devsim, logmgrctl, D-Bus and files.
 """
+import json
 import os
 import shutil
 import signal
@@ -40,6 +41,33 @@ def wait_for(condition, timeout=10.0, interval=0.02, message="condition"):
         if time.monotonic() > deadline:
             raise AssertionError(f"timed out after {timeout}s waiting for {message}")
         time.sleep(interval)
+
+
+# Emits one signal and stays connected until the daemon has answered a ping, which it does
+# only after handling the signal: the daemon asks the bus for a signal sender's uid, and a
+# sender already gone is nobody. Arguments in dbus-send's notation (string:x, uint32:7, ...).
+SIGNAL_SENDER = r"""
+import json, sys
+import dbus, dbus.lowlevel
+address, dest, path, interface, member, args = json.loads(sys.argv[1])
+types = {"string": dbus.String, "int32": dbus.Int32, "uint32": dbus.UInt32,
+         "int64": dbus.Int64, "byte": dbus.Byte, "boolean": lambda v: dbus.Boolean(v == "true")}
+bus = dbus.bus.BusConnection(address)
+msg = dbus.lowlevel.SignalMessage(path, interface, member)
+if dest:
+    msg.set_destination(dest)
+values = [types[a.partition(":")[0]](a.partition(":")[2]) for a in args]
+if values:
+    msg.append(*values)
+bus.send_message(msg)
+bus.flush()
+try:
+    bus.call_blocking("com.corvane.logmgr", "/", "org.freedesktop.DBus.Peer", "Ping", "", (),
+                      timeout=120)
+except dbus.exceptions.DBusException:
+    pass
+"""
+NOBODY = ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"]
 
 
 def valgrind_prefix(log_dir):
@@ -123,8 +151,23 @@ class Device:
         return self.run_tool("devsim", *args, check=check)
 
     def dbus_send(self, *args):
+        if args and args[0] == "--type=signal":
+            return self.send_signal(*args[1:])
         return subprocess.run(["dbus-send", "--system"] + list(args), env=self.env,
                               capture_output=True, text=True, timeout=30)
+
+    def send_signal(self, *args, as_nobody=False):
+        """A signal as dbus-send takes it ([--dest=NAME] PATH INTERFACE.MEMBER ARG...), sent by
+        root or by nobody; returns once the daemon has handled it."""
+        args = list(args)
+        dest = args.pop(0)[len("--dest="):] if args[0].startswith("--dest=") else ""
+        path, name = args[0], args[1]
+        interface, _, member = name.rpartition(".")
+        spec = json.dumps([self.env["DBUS_SYSTEM_BUS_ADDRESS"], dest, path, interface, member,
+                           args[2:]])
+        return subprocess.run((NOBODY if as_nobody else []) +
+                              ["/usr/bin/python3", "-c", SIGNAL_SENDER, spec], env=self.env,
+                              capture_output=True, text=True, timeout=150)
 
     def name_owner(self, name=BUS_NAME):
         r = self.dbus_send("--print-reply", "--dest=org.freedesktop.DBus", "/",

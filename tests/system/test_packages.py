@@ -86,9 +86,17 @@ class PackageMonitorTest(PackageCase):
             expected.append(("pkg.a", 2))
             self.settle(expected)
 
-        with self.subTest("the row text is cut at 131 characters"):
+        with self.subTest("a package id is stored as sent, or refused when it does not fit"):
+            forged = "pkg.o'x',0); DROP TABLE manage_app_survey; --"
+            self.status("q", forged, "start", "install")
+            self.status("q", forged, "end", "ok")
+            expected.append((forged, 0))
+            # The row text holds 131 characters: "'id',1" fits a 127-character id, and a
+            # quote takes two.
             self.dev.devsim("pkg", "uninstall", "p" * 127)
-            self.dev.devsim("pkg", "uninstall", "q" * 128)  # the type is cut off: no row
+            self.dev.devsim("pkg", "uninstall", "q" * 128)
+            self.status("r", "r" * 126 + "'", "start", "uninstall")
+            self.status("r", "r" * 126 + "'", "end", "ok")
             expected.append(("p" * 127, 1))
             self.settle(expected)
         self.assertIsNone(self.dev.daemon.poll())
