@@ -1,0 +1,345 @@
+"""Trust at the edges the daemon does not own: who may send the platform signals it acts on (the
+bus policy, and the host libraries' own sender check behind it), what may sit at a settings
+key or the relay outbox, and whether the service unit fits the daemon."""
+import configparser
+import json
+import os
+import re
+import signal
+import sqlite3
+import stat
+import subprocess
+import time
+import unittest
+from unittest import mock
+
+from harness import BIN_DIR, CONSENT_KEY, SOURCE_DIR, TIMEOUT_SCALE, VALGRIND, DeviceTestCase, \
+    wait_for
+
+NOBODY = ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"]
+FEATURE = "use_app_feature_survey"
+UNIT = os.path.join(SOURCE_DIR, "packaging", "logmgrd.service")
+TMPFILES = os.path.join(SOURCE_DIR, "packaging", "logmgrd.tmpfiles")
+OUTBOX = "/opt/usr/data/log-relay/outbox.jsonl"
+
+# path, interface, member, signature, arguments: one of each platform signal only root may send.
+ROOT_ONLY = [
+    ("/Org/Tizen/System/DeviceD/PowerOff", "org.tizen.system.deviced.PowerOff", "ChangeState",
+     "i", [1]),
+    ("/Org/Tizen/System/Crash/Crash", "org.tizen.system.crash.Crash", "ProcessCrashed", "ss",
+     ["x", "/usr/bin/x"]),
+    ("/Org/Tizen/System/Notification/Status_message",
+     "org.tizen.system.notification.status_message", "status_message", "s",
+     ["Screen captured."]),
+    ("/org/tizen/pkgmgr_status", "org.tizen.pkgmgr_status", "status", "sssss",
+     ["r", "tpk", "p", "start", "install"]),
+    ("/aul/dbus_handler", "org.tizen.aul.signal", "app_dead", "u", [1]),
+]
+
+# Prints "PATH INTERFACE.MEMBER" for every signal of the given interfaces it receives, and ends
+# once |count| of them came on path /root.
+LISTENER = r"""
+import sys, dbus, dbus.mainloop.glib
+from gi.repository import GLib
+dbus.mainloop.glib.DBusGMainLoop(set_as_default=True)
+bus, loop, left = dbus.SystemBus(), GLib.MainLoop(), [int(sys.argv[1])]
+def on(*args, path, interface, member):
+    print(path, interface + "." + member, flush=True)
+    if path == "/root":
+        left[0] -= 1
+        if left[0] == 0:
+            loop.quit()
+for iface in sys.argv[2:]:
+    bus.add_signal_receiver(on, dbus_interface=iface, path_keyword="path",
+                            interface_keyword="interface", member_keyword="member")
+print("ready", flush=True)
+loop.run()
+"""
+
+# Sends the signals given as JSON, then pings the daemon on the same connection: the answer
+# comes only once the daemon has dispatched everything this connection sent before it.
+SENDER = r"""
+import json, sys, dbus, dbus.lowlevel
+bus = dbus.SystemBus()
+kinds = {"s": dbus.String, "u": dbus.UInt32, "i": dbus.Int32}
+for path, iface, member, sig, args in json.loads(sys.argv[1]):
+    msg = dbus.lowlevel.SignalMessage(path, iface, member)
+    msg.append(*[kinds[k](a) for k, a in zip(sig, args)], signature=sig)
+    bus.send_message(msg)
+try:
+    bus.call_blocking("com.corvane.logmgr", "/", "org.freedesktop.DBus.Peer", "Ping", "", ())
+except dbus.exceptions.DBusException:
+    pass
+"""
+
+
+class FilesCase(DeviceTestCase):
+
+    def send(self, signals, as_nobody=False):
+        """Sends (path, interface, member, signature, args) signals and waits for the daemon to
+        have dispatched them."""
+        r = subprocess.run((NOBODY if as_nobody else []) +
+                           ["/usr/bin/python3", "-c", SENDER, json.dumps(signals)],
+                           env=self.dev.env, capture_output=True, text=True, timeout=60)
+        self.assertEqual(r.returncode, 0, r.stderr)
+
+    def dbus_send_as_nobody(self, path, iface, member, *args, dest=None):
+        r = subprocess.run(NOBODY + ["dbus-send", "--system", "--type=signal"] +
+                           ([f"--dest={dest}"] if dest else []) + [path, f"{iface}.{member}"] +
+                           list(args), env=self.dev.env, capture_output=True, text=True,
+                           timeout=30)
+        self.assertEqual(r.returncode, 0, r.stderr)  # a broadcast is refused silently
+
+    def features(self, code):
+        return self.dev.query(".SurveyLog.db",
+                              f"SELECT feature FROM {FEATURE} WHERE feature=?", (code,))
+
+    def start(self, **kwargs):
+        self.dev.set_consent(True)
+        proc = self.dev.start_daemon(**kwargs)
+        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
+                                        "WHERE name LIKE '%_survey'") == [(5,)],
+                 message="the survey tables")
+        return proc
+
+    def listen(self, count, interfaces):
+        proc = subprocess.Popen(["/usr/bin/python3", "-c", LISTENER, str(count)] + interfaces,
+                                env=self.dev.env, stdout=subprocess.PIPE, text=True)
+        self.addCleanup(lambda: proc.poll() is None and proc.kill())
+        self.assertEqual(proc.stdout.readline().strip(), "ready")
+        return proc
+
+
+class SignalPolicyTest(FilesCase):
+
+    def test_bus_lets_only_root_send_the_platform_signals_and_anyone_the_wake_up(self):
+        interfaces = [s[1] for s in ROOT_ONLY]
+        listener = self.listen(len(ROOT_ONLY), interfaces)
+        proc = self.start()
+        kinds = {"s": "string", "u": "uint32", "i": "int32"}
+        for path, iface, member, sig, args in ROOT_ONLY:
+            typed = [f"{kinds[k]}:{a}" for k, a in zip(sig, args)]
+            self.dbus_send_as_nobody("/forged", iface, member, *typed)
+            # Addressed straight to the daemon, the bus refuses it just the same.
+            self.dbus_send_as_nobody(path, iface, member, *typed, dest="com.corvane.logmgr")
+        # Control: root's copies, on another path, reach a listener that saw none of nobody's
+        # (root's power-off has another member, so that the daemon keeps running).
+        controls = [("/root",) + s[1:] for s in ROOT_ONLY[1:]]
+        controls.append(("/root", ROOT_ONLY[0][1], "Other", "", []))
+        self.send(controls)
+        out, _ = listener.communicate(timeout=30 * TIMEOUT_SCALE)
+        self.assertEqual(sorted(out.split("\n")[:-1]),
+                         sorted(f"/root {c[1]}.{c[2]}" for c in controls))
+
+        # Through the daemon: nobody's power-off did not stop it, nobody's capture wrote
+        # nothing, root's capture counts and the wake-up counts from anyone.
+        self.assertIsNone(proc.poll())
+        self.assertEqual(self.features("CAPT"), [("CAPT",)])
+        self.dbus_send_as_nobody("/org/tizen/sensor/context/movement",
+                                 "org.tizen.sensor.context.movement", "wakeup",
+                                 dest="com.corvane.logmgr")
+        wait_for(lambda: self.features("UNLO"), message="the wake-up's row")
+        self.send([ROOT_ONLY[0]])
+        self.assertEqual(self.dev.wait_exit(proc), 0)
+
+
+class OpenBusCase(FilesCase):
+    """A bus without our signal denials: forged platform signals reach every listener."""
+
+    def setUp(self):
+        with mock.patch.dict(os.environ, {"LOGMGR_OPEN_SIGNALS": "1"}):
+            super().setUp()
+
+
+class ForgedPlatformEventsTest(OpenBusCase):
+    WITH_X = True
+    APPS = {"com.ex.front": "pkg.front", "com.ex.back": "pkg.back"}
+
+    def rows(self, sql):
+        return self.dev.query(".SurveyLog.db", sql)
+
+    def root_watched(self):
+        from Xlib import X, display
+        d = display.Display(self.dev.env["DISPLAY"])
+        try:
+            return d.screen().root.get_attributes().all_event_masks & X.PropertyChangeMask
+        finally:
+            d.close()
+
+    def test_package_and_launch_events_count_only_from_root(self):
+        status = ("/org/tizen/pkgmgr_status", "org.tizen.pkgmgr_status", "status", "sssss")
+        aul = ("/aul/dbus_handler", "org.tizen.aul.signal")
+        pids = {}
+        for app, package in self.APPS.items():
+            self.dev.devsim("app", "install", app, "--package", package)
+        self.start()
+        for app in self.APPS:
+            pids[app] = int(self.dev.devsim("app", "launch", app).stdout)
+            self.addCleanup(self.dev.devsim, "app", "kill", app, check=False)
+        # The open bus does carry nobody's signals to listeners.
+        listener = self.listen(1, [status[1]])
+        self.dbus_send_as_nobody(*status[:3], "string:r", "string:tpk", "string:pkg.x",
+                                 "string:end", "string:ok")
+        self.send([status[:3] + ("sssss", ["r", "tpk", "pkg.x", "end", "fail"])])
+        self.send([("/root",) + status[1:] + (["r", "tpk", "pkg.x", "end", "fail"],)])
+        self.assertIn("/org/tizen/pkgmgr_status", listener.communicate(timeout=30)[0])
+
+        with self.subTest("package events"):
+            forged = [status + (["f", "tpk", "pkg.forged", key, val],)
+                      for key, val in (("start", "install"), ("end", "ok"))]
+            self.send(forged, as_nobody=True)
+            self.send([status + (["g", "tpk", "pkg.real", key, val],)
+                       for key, val in (("start", "install"), ("end", "ok"))])
+            wait_for(lambda: self.rows("SELECT installed_app_id FROM manage_app_survey"),
+                     message="the package row")
+            self.assertEqual(self.rows("SELECT installed_app_id, type FROM manage_app_survey"),
+                             [("pkg.real", 0)])
+
+        with self.subTest("launch and death"):
+            front, back = list(self.APPS)
+            launches = [aul + ("app_launch", "u", [pids[a]]) for a in self.APPS]
+            self.send(launches, as_nobody=True)
+            self.send(launches)
+            wait_for(self.root_watched, message="the daemon to watch the root window")
+            # back in front, then front: back's period is written, front's has begun.
+            self.dev.devsim("app", "focus", back)
+            self.dev.devsim("app", "focus", front)
+            wait_for(lambda: self.rows("SELECT app_id FROM use_app_survey"),
+                     message="back's period")
+            # A forged death would end front's period (or drop front unrecorded).
+            self.send([aul + ("app_dead", "u", [pids[front]])], as_nobody=True)
+            self.assertEqual(self.rows("SELECT app_id FROM use_app_survey"), [("pkg.back",)])
+            self.dev.devsim("app", "focus", back)
+            wait_for(lambda: len(self.rows("SELECT app_id FROM use_app_survey")) == 2,
+                     message="front's period")
+            self.assertEqual(self.rows("SELECT app_id FROM use_app_survey ORDER BY _id"),
+                             [("pkg.back",), ("pkg.front",)])
+
+
+class KeyFilesTest(FilesCase):
+
+    def test_a_fifo_at_a_key_never_stalls_the_daemon(self):
+        proc = self.start()
+        for n, key in enumerate((CONSENT_KEY, "memory/pm/state")):
+            with self.subTest(key):
+                path = self.dev.path(("/opt/var/kdb/" if key.startswith("db/") else "/var/run/")
+                                     + key)
+                os.makedirs(os.path.dirname(path), exist_ok=True)
+                # Renamed into place, as a key is set: the daemon is told about it at once.
+                os.mkfifo(path + ".fifo")
+                os.rename(path + ".fifo", path)
+                r = subprocess.run([os.path.join(BIN_DIR, "logmgrctl"), "insert", FEATURE,
+                                    "app_id=probe", f"feature=P{n}"], env=self.dev.env,
+                                   capture_output=True, text=True, timeout=20 * TIMEOUT_SCALE)
+                self.assertEqual(r.returncode, 0, r.stderr)
+                # A key still set the ordinary way keeps working.
+                self.dev.vconf_set("memory/sysman/earjack", "int", "1")
+                self.dev.vconf_set("memory/sysman/earjack", "int", "0")
+                wait_for(lambda: len(self.features("HEAD")) == n + 1, message="a headset row")
+                self.assertIsNone(proc.poll())
+        self.assertEqual(len(self.features("P0")) + len(self.features("P1")), 2)
+
+
+class OutboxAndDatabasesTest(FilesCase):
+
+    def pref(self, key):
+        rows = self.dev.query(".pref.db", "SELECT pref_data FROM pref WHERE pref_key=?", (key,))
+        return rows[0][0] if rows else None
+
+    def set_prefs(self, sent):
+        con = sqlite3.connect(self.dev.db_path(".pref.db"), timeout=10)
+        con.execute("INSERT OR REPLACE INTO pref VALUES('key_sent_date',?)", (str(sent),))
+        con.execute("DELETE FROM pref WHERE pref_key='key_delete_date'")
+        con.commit()
+        con.close()
+
+    def test_outbox_never_follows_a_link_and_files_are_owner_only_under_umask_0(self):
+        umask0 = ["sh", "-c", 'umask 000; exec "$0"']
+        tm = time.localtime()
+        two_days_ago = int(time.mktime((tm.tm_year, tm.tm_mon, tm.tm_mday - 2, 0, 0, 0, 0, 0,
+                                        -1)))
+        proc = self.start(prefix=umask0)
+        wait_for(lambda: self.pref("key_sent_date"), message="the first start")
+        proc.send_signal(signal.SIGTERM)
+        self.assertEqual(self.dev.wait_exit(proc), 0)
+
+        target = os.path.join(self.dev.sysroot, "target")
+        with open(target, "w") as f:
+            f.write("keep\n")
+        outbox = self.dev.path(OUTBOX)
+        os.makedirs(os.path.dirname(outbox), exist_ok=True)
+        os.symlink(target, outbox)
+        self.set_prefs(two_days_ago)
+        proc = self.dev.start_daemon(prefix=umask0)
+        # The run ends with the weekly purge date: by then the hand-over was tried.
+        wait_for(lambda: self.pref("key_delete_date"), timeout=30, message="the report run")
+        with open(target) as f:
+            self.assertEqual(f.read(), "keep\n")
+        self.assertTrue(os.path.islink(outbox))
+        proc.send_signal(signal.SIGTERM)
+        self.assertEqual(self.dev.wait_exit(proc), 0)
+
+        # Without the link the records left queued are handed over into a file of our own.
+        os.unlink(outbox)
+        self.set_prefs(two_days_ago)
+        self.dev.start_daemon(prefix=umask0)
+        wait_for(lambda: os.path.exists(outbox) and os.path.getsize(outbox) > 0, timeout=30,
+                 message="records in the outbox")
+        dbspace = os.path.dirname(self.dev.db_path(".pref.db"))
+        paths = [outbox] + [os.path.join(dbspace, n) for n in sorted(os.listdir(dbspace))]
+        self.assertGreaterEqual(len(paths), 5)  # the outbox and the four databases at least
+        for path in paths:
+            with self.subTest(path):
+                self.assertEqual(stat.S_IMODE(os.lstat(path).st_mode), 0o600)
+
+
+class ServiceUnitTest(FilesCase):
+
+    def test_unit_lets_the_daemon_write_what_it_writes_and_bounds_it(self):
+        unit = configparser.ConfigParser(strict=False, interpolation=None)
+        unit.optionxform = str
+        unit.read(UNIT)
+        service = unit["Service"]
+        writable = service["ReadWritePaths"].split()
+        with open(TMPFILES) as f:
+            made = {line.split()[1] for line in f if line.startswith("d ")}
+        # A writable path missing at start would keep the unit from starting at all.
+        self.assertLessEqual(set(writable), made)
+
+        r = subprocess.run(["systemd-analyze", "security", "--offline=true", UNIT],
+                           capture_output=True, text=True, timeout=60)
+        score = re.search(r"Overall exposure level for \S+: ([0-9.]+)", r.stdout)
+        self.assertIsNotNone(score, r.stdout + r.stderr)
+        self.assertLessEqual(float(score.group(1)), 1.5)
+
+        started = time.time()
+        proc = self.start()
+        dump_key = self.dev.path("/opt/var/kdb/db/corvane-log-manager/dumpcontext")
+        wait_for(lambda: os.path.exists(dump_key), message="the dump key")
+        for n in range(20):
+            self.dev.run_tool("logmgrctl", "insert", FEATURE, "app_id=a", f"feature=F{n}")
+        written = []
+        for root, dirs, files in os.walk(self.dev.sysroot):
+            rel = os.path.relpath(root, self.dev.sysroot)
+            if rel == "run" or rel.startswith("run/"):
+                continue  # the bus and host-env's own state
+            for name in files:
+                path = os.path.join(root, name)
+                if name != "logmgrd.out" and os.lstat(path).st_mtime >= started:
+                    written.append("/" + os.path.relpath(path, self.dev.sysroot))
+        self.assertIn("/opt/var/kdb/db/corvane-log-manager/dumpcontext", written)
+        for path in written:
+            with self.subTest(path):
+                self.assertTrue(any(path.startswith(w.rstrip("/") + "/") for w in writable))
+
+        if not VALGRIND:  # memcheck's own footprint says nothing about the daemon's
+            with open(f"/proc/{proc.pid}/status") as f:
+                status = dict(line.split(":", 1) for line in f)
+            peak_kb = int(status["VmHWM"].split()[0])
+            max_kb = int(service["MemoryMax"].rstrip("M")) * 1024
+            self.assertLess(peak_kb * 2, max_kb)
+            self.assertLess(int(status["Threads"]) * 2, int(service["TasksMax"]))
+
+
+if __name__ == "__main__":
+    unittest.main()
