@@ -1,0 +1,84 @@
+"""A start that keeps failing (the survey database cannot be opened) is retried cheaply, without
+growing, ends on SIGTERM, and becomes a normal start once the obstacle is gone."""
+import os
+import signal
+import time
+
+from harness import DeviceTestCase, wait_for
+
+CLOCK_TICKS = os.sysconf("SC_CLK_TCK")
+
+
+def cpu_ticks(pid):
+    with open(f"/proc/{pid}/stat") as f:
+        fields = f.read().rpartition(")")[2].split()
+    return int(fields[11]) + int(fields[12])  # utime + stime
+
+
+def rss_kb(pid):
+    with open(f"/proc/{pid}/status") as f:
+        return next(int(l.split()[1]) for l in f if l.startswith("VmRSS:"))
+
+
+class StartRetryTest(DeviceTestCase):
+
+    def start_blocked(self, database=".SurveyLog.db"):
+        # A directory where a database belongs: the start fails on it.
+        os.makedirs(self.dev.db_path(database))
+        self.dev.set_consent(True)
+        proc = self.dev.start_daemon()
+        self.dev.wait_started()
+        return proc
+
+    def insert(self, app_id):
+        return self.dev.run_tool("logmgrctl", "insert", "use_app_feature_survey",
+                                 f"app_id={app_id}", "feature=TEST", check=False).returncode == 0
+
+    def test_retries_stay_cheap_and_flat_then_start_once_the_file_is_usable(self):
+        proc = self.start_blocked()
+        # A polled window of a few seconds of retries: the CPU used stays a small share of
+        # the time that passed, and memory does not grow with the retries.
+        t0, ticks0, rss0 = time.monotonic(), cpu_ticks(proc.pid), rss_kb(proc.pid)
+        rss = [rss0]
+
+        def window_over():
+            rss.append(rss_kb(proc.pid))
+            return time.monotonic() - t0 >= 3
+        wait_for(window_over, interval=0.2, message="the measuring window")
+        elapsed_ticks = (time.monotonic() - t0) * CLOCK_TICKS
+        used = cpu_ticks(proc.pid) - ticks0
+        self.assertLess(used, 0.2 * elapsed_ticks, f"{used} ticks in {elapsed_ticks:.0f}")
+        self.assertLess(max(rss) - rss0, 4096, f"RSS samples (kB): {rss}")
+        self.assertIsNone(proc.poll())
+
+        os.rmdir(self.dev.db_path(".SurveyLog.db"))
+        wait_for(lambda: self.insert("after.obstacle"), message="a bus Insert to succeed")
+        rows = self.dev.query(".SurveyLog.db", "SELECT app_id FROM use_app_feature_survey "
+                                               "WHERE feature = 'TEST'")
+        self.assertEqual(rows, [("after.obstacle",)])
+        self.assert_one_row_per_crash()
+
+    def test_a_start_failing_after_the_monitors_began_starts_each_once(self):
+        # The snapshot store fails the first attempt after the crash monitor has started;
+        # the retry gets past it (the store stays, failing its operations).
+        self.start_blocked(".StatusMonitor.db")
+        wait_for(lambda: self.insert("started"), message="a bus Insert to succeed")
+        self.assert_one_row_per_crash()
+
+    def assert_one_row_per_crash(self):
+        self.dev.devsim("app", "install", "com.ex.retry")
+        self.dev.devsim("crash", "com.ex.retry")  # returns once the daemon has handled it
+        crashes = lambda: self.dev.query(".SurveyLog.db",
+                                         "SELECT app_id FROM report_app_error_survey")
+        wait_for(crashes, message="the crash row")
+        self.assertEqual(crashes(), [("com.ex.retry",)])
+
+    def test_sigterm_during_the_retries_ends_with_status_zero(self):
+        proc = self.start_blocked()
+        proc.send_signal(signal.SIGTERM)
+        self.assertEqual(self.dev.wait_exit(proc), 0)
+
+
+if __name__ == "__main__":
+    import unittest
+    unittest.main()
