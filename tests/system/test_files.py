@@ -2,7 +2,6 @@
 bus policy, and the host libraries' own sender check behind it), what may sit at a settings
 key or the relay outbox, and whether the service unit fits the daemon."""
 import configparser
-import json
 import os
 import re
 import signal
@@ -13,28 +12,29 @@ import time
 import unittest
 from unittest import mock
 
-from harness import BIN_DIR, CONSENT_KEY, SOURCE_DIR, TIMEOUT_SCALE, VALGRIND, DeviceTestCase, \
-    wait_for
+from harness import BIN_DIR, CONSENT_KEY, NOBODY, SOURCE_DIR, TIMEOUT_SCALE, VALGRIND, \
+    DeviceTestCase, wait_for
 
-NOBODY = ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"]
 FEATURE = "use_app_feature_survey"
 UNIT = os.path.join(SOURCE_DIR, "packaging", "logmgrd.service")
 TMPFILES = os.path.join(SOURCE_DIR, "packaging", "logmgrd.tmpfiles")
 OUTBOX = "/opt/usr/data/log-relay/outbox.jsonl"
 
-# path, interface, member, signature, arguments: one of each platform signal only root may send.
+# One of each platform signal only root may send: path, interface, member, arguments.
 ROOT_ONLY = [
     ("/Org/Tizen/System/DeviceD/PowerOff", "org.tizen.system.deviced.PowerOff", "ChangeState",
-     "i", [1]),
-    ("/Org/Tizen/System/Crash/Crash", "org.tizen.system.crash.Crash", "ProcessCrashed", "ss",
-     ["x", "/usr/bin/x"]),
+     ["int32:1"]),
+    ("/Org/Tizen/System/Crash/Crash", "org.tizen.system.crash.Crash", "ProcessCrashed",
+     ["string:x", "string:/usr/bin/x"]),
     ("/Org/Tizen/System/Notification/Status_message",
-     "org.tizen.system.notification.status_message", "status_message", "s",
-     ["Screen captured."]),
-    ("/org/tizen/pkgmgr_status", "org.tizen.pkgmgr_status", "status", "sssss",
-     ["r", "tpk", "p", "start", "install"]),
-    ("/aul/dbus_handler", "org.tizen.aul.signal", "app_dead", "u", [1]),
+     "org.tizen.system.notification.status_message", "status_message",
+     ["string:Screen captured."]),
+    ("/org/tizen/pkgmgr_status", "org.tizen.pkgmgr_status", "status",
+     ["string:r", "string:tpk", "string:p", "string:start", "string:install"]),
+    ("/aul/dbus_handler", "org.tizen.aul.signal", "app_dead", ["uint32:1"]),
 ]
+STATUS = ("/org/tizen/pkgmgr_status", "org.tizen.pkgmgr_status.status")
+AUL = ("/aul/dbus_handler", "org.tizen.aul.signal")
 
 # Prints "PATH INTERFACE.MEMBER" for every signal of the given interfaces it receives, and ends
 # once |count| of them came on path /root.
@@ -56,31 +56,11 @@ print("ready", flush=True)
 loop.run()
 """
 
-# Sends the signals given as JSON, then pings the daemon on the same connection: the answer
-# comes only once the daemon has dispatched everything this connection sent before it.
-SENDER = r"""
-import json, sys, dbus, dbus.lowlevel
-bus = dbus.SystemBus()
-kinds = {"s": dbus.String, "u": dbus.UInt32, "i": dbus.Int32}
-for path, iface, member, sig, args in json.loads(sys.argv[1]):
-    msg = dbus.lowlevel.SignalMessage(path, iface, member)
-    msg.append(*[kinds[k](a) for k, a in zip(sig, args)], signature=sig)
-    bus.send_message(msg)
-try:
-    bus.call_blocking("com.corvane.logmgr", "/", "org.freedesktop.DBus.Peer", "Ping", "", ())
-except dbus.exceptions.DBusException:
-    pass
-"""
-
-
 class FilesCase(DeviceTestCase):
 
-    def send(self, signals, as_nobody=False):
-        """Sends (path, interface, member, signature, args) signals and waits for the daemon to
-        have dispatched them."""
-        r = subprocess.run((NOBODY if as_nobody else []) +
-                           ["/usr/bin/python3", "-c", SENDER, json.dumps(signals)],
-                           env=self.dev.env, capture_output=True, text=True, timeout=60)
+    def send(self, path, name, *args, as_nobody=False):
+        """Sends one signal (dbus-send's notation) and returns once the daemon has handled it."""
+        r = self.dev.send_signal(path, name, *args, as_nobody=as_nobody)
         self.assertEqual(r.returncode, 0, r.stderr)
 
     def dbus_send_as_nobody(self, path, iface, member, *args, dest=None):
@@ -117,17 +97,16 @@ class SignalPolicyTest(FilesCase):
         interfaces = [s[1] for s in ROOT_ONLY]
         listener = self.listen(len(ROOT_ONLY), interfaces)
         proc = self.start()
-        kinds = {"s": "string", "u": "uint32", "i": "int32"}
-        for path, iface, member, sig, args in ROOT_ONLY:
-            typed = [f"{kinds[k]}:{a}" for k, a in zip(sig, args)]
-            self.dbus_send_as_nobody("/forged", iface, member, *typed)
+        for path, iface, member, args in ROOT_ONLY:
+            self.dbus_send_as_nobody("/forged", iface, member, *args)
             # Addressed straight to the daemon, the bus refuses it just the same.
-            self.dbus_send_as_nobody(path, iface, member, *typed, dest="com.corvane.logmgr")
+            self.dbus_send_as_nobody(path, iface, member, *args, dest="com.corvane.logmgr")
         # Control: root's copies, on another path, reach a listener that saw none of nobody's
         # (root's power-off has another member, so that the daemon keeps running).
         controls = [("/root",) + s[1:] for s in ROOT_ONLY[1:]]
-        controls.append(("/root", ROOT_ONLY[0][1], "Other", "", []))
-        self.send(controls)
+        controls.append(("/root", ROOT_ONLY[0][1], "Other", []))
+        for _, iface, member, args in controls:
+            self.send("/root", f"{iface}.{member}", *args)
         out, _ = listener.communicate(timeout=30 * TIMEOUT_SCALE)
         self.assertEqual(sorted(out.split("\n")[:-1]),
                          sorted(f"/root {c[1]}.{c[2]}" for c in controls))
@@ -140,7 +119,7 @@ class SignalPolicyTest(FilesCase):
                                  "org.tizen.sensor.context.movement", "wakeup",
                                  dest="com.corvane.logmgr")
         wait_for(lambda: self.features("UNLO"), message="the wake-up's row")
-        self.send([ROOT_ONLY[0]])
+        self.send(ROOT_ONLY[0][0], ".".join(ROOT_ONLY[0][1:3]), *ROOT_ONLY[0][3])
         self.assertEqual(self.dev.wait_exit(proc), 0)
 
 
@@ -168,8 +147,6 @@ class ForgedPlatformEventsTest(OpenBusCase):
             d.close()
 
     def test_package_and_launch_events_count_only_from_root(self):
-        status = ("/org/tizen/pkgmgr_status", "org.tizen.pkgmgr_status", "status", "sssss")
-        aul = ("/aul/dbus_handler", "org.tizen.aul.signal")
         pids = {}
         for app, package in self.APPS.items():
             self.dev.devsim("app", "install", app, "--package", package)
@@ -178,19 +155,18 @@ class ForgedPlatformEventsTest(OpenBusCase):
             pids[app] = int(self.dev.devsim("app", "launch", app).stdout)
             self.addCleanup(self.dev.devsim, "app", "kill", app, check=False)
         # The open bus does carry nobody's signals to listeners.
-        listener = self.listen(1, [status[1]])
-        self.dbus_send_as_nobody(*status[:3], "string:r", "string:tpk", "string:pkg.x",
-                                 "string:end", "string:ok")
-        self.send([status[:3] + ("sssss", ["r", "tpk", "pkg.x", "end", "fail"])])
-        self.send([("/root",) + status[1:] + (["r", "tpk", "pkg.x", "end", "fail"],)])
-        self.assertIn("/org/tizen/pkgmgr_status", listener.communicate(timeout=30)[0])
+        listener = self.listen(1, [STATUS[1].rpartition(".")[0]])
+        self.dbus_send_as_nobody(STATUS[0], *STATUS[1].rsplit(".", 1), "string:r",
+                                 "string:tpk", "string:pkg.x", "string:end", "string:fail")
+        self.send("/root", STATUS[1], "string:r", "string:tpk", "string:pkg.x", "string:end",
+                  "string:fail")
+        self.assertIn(STATUS[0], listener.communicate(timeout=30 * TIMEOUT_SCALE)[0])
 
         with self.subTest("package events"):
-            forged = [status + (["f", "tpk", "pkg.forged", key, val],)
-                      for key, val in (("start", "install"), ("end", "ok"))]
-            self.send(forged, as_nobody=True)
-            self.send([status + (["g", "tpk", "pkg.real", key, val],)
-                       for key, val in (("start", "install"), ("end", "ok"))])
+            for req, pkg, nobody in (("f", "pkg.forged", True), ("g", "pkg.real", False)):
+                for key, val in (("start", "install"), ("end", "ok")):
+                    self.send(*STATUS, f"string:{req}", "string:tpk", f"string:{pkg}",
+                              f"string:{key}", f"string:{val}", as_nobody=nobody)
             wait_for(lambda: self.rows("SELECT installed_app_id FROM manage_app_survey"),
                      message="the package row")
             self.assertEqual(self.rows("SELECT installed_app_id, type FROM manage_app_survey"),
@@ -198,9 +174,10 @@ class ForgedPlatformEventsTest(OpenBusCase):
 
         with self.subTest("launch and death"):
             front, back = list(self.APPS)
-            launches = [aul + ("app_launch", "u", [pids[a]]) for a in self.APPS]
-            self.send(launches, as_nobody=True)
-            self.send(launches)
+            for nobody in (True, False):
+                for app in self.APPS:
+                    self.send(AUL[0], f"{AUL[1]}.app_launch", f"uint32:{pids[app]}",
+                              as_nobody=nobody)
             wait_for(self.root_watched, message="the daemon to watch the root window")
             # back in front, then front: back's period is written, front's has begun.
             self.dev.devsim("app", "focus", back)
@@ -208,7 +185,7 @@ class ForgedPlatformEventsTest(OpenBusCase):
             wait_for(lambda: self.rows("SELECT app_id FROM use_app_survey"),
                      message="back's period")
             # A forged death would end front's period (or drop front unrecorded).
-            self.send([aul + ("app_dead", "u", [pids[front]])], as_nobody=True)
+            self.send(AUL[0], f"{AUL[1]}.app_dead", f"uint32:{pids[front]}", as_nobody=True)
             self.assertEqual(self.rows("SELECT app_id FROM use_app_survey"), [("pkg.back",)])
             self.dev.devsim("app", "focus", back)
             wait_for(lambda: len(self.rows("SELECT app_id FROM use_app_survey")) == 2,
