@@ -55,6 +55,18 @@ TEST_F(AppUsageMonitorTest, WritesOnePeriodPerForegroundChange) {
   EXPECT_EQ(Periods(), "pkg.alpha:5000;pkg.beta:2000;pkg.alpha:600;");
 }
 
+TEST_F(AppUsageMonitorTest, StoresThePackageIdFromTheAppDatabaseVerbatim) {
+  const std::string forged = "pkg.o'q',1); DELETE FROM use_app_survey; --";
+  std::string forFixture;  // the fixture's own statement needs the quotes doubled
+  for (char c : forged) forFixture += c == '\'' ? "''" : std::string(1, c);
+  Install("com.ex.quote", forFixture, "/opt/usr/apps/quote/bin/quote");
+  pid_t quote = Run("/opt/usr/apps/quote/bin/quote");
+  ActivateAt(kT0, alpha);
+  ActivateAt(kT0 + 300, quote);
+  ActivateAt(kT0 + 700, alpha);
+  EXPECT_EQ(Periods(), "pkg.alpha:300;" + forged + ":400;");
+}
+
 TEST_F(AppUsageMonitorTest, ExcludedPackagesAreNeverTracked) {
   const char* const excluded[] = {"com.corvane.lockscreen", "com.corvane.w-home", "Homescreen",
                                   "com.corvane.homescreen", ""};
