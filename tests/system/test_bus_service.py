@@ -6,9 +6,13 @@ import subprocess
 import unittest
 
 import dbus
+from dbus.mainloop.glib import DBusGMainLoop
+from gi.repository import GLib
 
-from bus_client import FEATURE, STATUS, Segment, parse_segment, raw_call, table_proxy
+from bus_client import (FEATURE, IFACE_PREFIX, PATH_PREFIX, STATUS, Segment, parse_segment,
+                        raw_call, table_proxy)
 from harness import DeviceTestCase, wait_for
+from test_lifecycle import has_consent_watch
 
 IMPROPER = "Improper Values Provided"
 NOBODY = ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"]
@@ -78,6 +82,46 @@ class BusServiceTest(DeviceTestCase):
         self.assertEqual(self.feature.Delete("app_id='y'"), 1)
         self.assertEqual(self.status.Delete("app_id='x'"), 2)
         self.assertEqual(self.table_rows(FEATURE), [("x", "F", "e", 1)])
+
+    def test_a_new_status_pair_is_inserted_whole_and_only_an_existing_one_is_updated(self):
+        # Values too long for an update's 200-byte lists, and a comma, which an update would cut:
+        # a new (app_id, feature) pair is an insert and takes them as they are.
+        extra = "e" * 150 + ",x"
+        row_id = self.status.Insert({"app_id": "a", "feature": "F", "extra": extra, "value": "1"})
+        self.assertEqual(self.table_rows(STATUS), [("a", "F", extra, 1)])
+        # The same pair again is an update: refused with the upsert's failure, row unchanged.
+        for values in ({"extra": extra}, {"extra": "a,b"}, {"extra": "e" * 180}):
+            with self.subTest(values=values):
+                self.assert_bus_error(lambda: self.status.Insert(
+                    {"app_id": "a", "feature": "F", "value": "2", **values}), "API Failed")
+                self.assertEqual(self.table_rows(STATUS), [("a", "F", extra, 1)])
+        self.assertEqual(self.status.Insert({"app_id": "a", "feature": "F", "extra": "short",
+                                             "value": "3"}), row_id)
+        self.assertEqual(self.table_rows(STATUS), [("a", "F", "short", 3)])
+
+    def test_the_main_loop_never_waits_for_another_process_lock(self):
+        self.feature.Insert({"app_id": "x", "feature": "F"})
+        holder = sqlite3.connect(self.dev.db_path(".SurveyLog.db"), timeout=5,
+                                 isolation_level=None)
+        self.addCleanup(holder.close)
+        holder.execute("BEGIN IMMEDIATE")  # the write lock, held until the answer is in
+        replies = []
+        bus = dbus.bus.BusConnection(self.dev.env["DBUS_SYSTEM_BUS_ADDRESS"],
+                                     mainloop=DBusGMainLoop())
+        self.addCleanup(bus.close)
+        proxy = dbus.Interface(bus.get_object("com.corvane.logmgr", PATH_PREFIX + FEATURE),
+                               IFACE_PREFIX + FEATURE)
+        proxy.Insert({"app_id": "y", "feature": "F"}, timeout=120,
+                     reply_handler=lambda *r: replies.append(("ok", r)),
+                     error_handler=lambda e: replies.append(("error", e.get_dbus_message())))
+        context = GLib.MainContext.default()
+        # A wait for the lock (2 s with the old busy timeout) would not answer in time.
+        wait_for(lambda: (context.iteration(False), replies)[1], timeout=1.5, interval=0.005,
+                 message="an answer while the lock is held")
+        self.assertEqual(replies, [("error", "Insert API Failed")])
+        holder.execute("ROLLBACK")
+        self.assertGreater(self.feature.Insert({"app_id": "z", "feature": "F"}), 0)
+        self.assertEqual(self.table_rows(FEATURE, "app_id"), [("x",), ("z",)])
 
     def test_select_writes_every_row_into_an_owned_segment_large_enough(self):
         self.feature.Insert({"app_id": "x", "feature": "F", "value": "1"})
@@ -200,6 +244,32 @@ class BusServiceTest(DeviceTestCase):
                 self.assertEqual(seg.read(), bytes(1 << 16))
         self.assertEqual(self.other_tables(), before)
         self.assertEqual(self.dev.daemon.poll(), None)
+
+
+class StartTogetherTest(DeviceTestCase):
+
+    def test_two_daemons_starting_on_fresh_files_both_start(self):
+        # The one place a statement waits for another process: the open phase, where a second
+        # daemon's table creation meets the first's (without the wait one of them ended at
+        # start in nearly every round).
+        self.dev.set_consent(True)
+        first = self.dev.start_daemon(wait_for_name=False)
+        second = self.dev.start_daemon(wait_for_name=False)
+        wait_for(lambda: len(self.dev.name_queue()) == 2 or None not in (first.poll(),
+                                                                        second.poll()),
+                 message="both daemons on the bus")
+        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
+                                        "WHERE name LIKE '%_survey'") == [(5,)]
+                 and self.dev.query(".ServerUploaderDB.db", "SELECT COUNT(*) FROM "
+                                    "sqlite_master") == [(2,)],
+                 message="the tables")
+        # Each has opened its stores once it watches the consent key (or it has ended).
+        for proc in (first, second):
+            wait_for(lambda: has_consent_watch(proc.pid) or proc.poll() is not None,
+                     message="the deferred start")
+        self.assertGreater(table_proxy(self.dev, FEATURE).Insert({"app_id": "x",
+                                                                   "feature": "F"}), 0)
+        self.assertEqual((first.poll(), second.poll()), (None, None))
 
 
 if __name__ == "__main__":
