@@ -245,7 +245,12 @@ class Page {
     out_ += "</div></div>\n";
 
     out_ += "<div class=\"group\">Apps in front</div>\n";
-    if (day_.apps.empty()) out_ += "<p class=\"note\">No foreground periods recorded.</p>\n";
+    if (day_.apps.empty()) {
+      out_ += day_.foregroundFromRecords
+                  ? "<p class=\"note\">No foreground rows left: the day was condensed into the "
+                    "relay records below.</p>\n"
+                  : "<p class=\"note\">No foreground periods recorded.</p>\n";
+    }
     std::map<std::string, std::vector<const Period*>> byApp;
     std::vector<std::string> order;
     for (const Period& p : day_.apps) {
