@@ -51,6 +51,8 @@ int64_t ThreadCpuNs() {
 // Creates |path| owner-only when it does not exist yet. Not following a link, and exclusive,
 // so an existing file (or anything else at the path) is left to SQLite as it is.
 void CreateOwnerOnly(const char* path) {
+  // SQLite's own names (":memory:", "", URIs) are no files to make.
+  if (path[0] == '\0' || path[0] == ':' || strncmp(path, "file:", 5) == 0) return;
   int fd = open(path, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
   if (fd < 0) return;
   (void)fchmod(fd, 0600);  // the umask may have taken bits off, never added any

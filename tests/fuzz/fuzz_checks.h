@@ -172,6 +172,14 @@ inline std::string Agree(const char* what, bool fits, Built built) {
   return "";
 }
 
+// An _id a caller may give: decimal digits only, from 1 to 2^53.
+inline bool CallerRowIdAllowed(const std::string& value) {
+  if (value.empty() || value.find_first_not_of("0123456789") != std::string::npos) return false;
+  std::string digits = value.substr(std::min(value.find_first_not_of('0'), value.size()));
+  if (digits.empty() || digits.size() > 16) return false;
+  return std::stoull(digits) <= (1ULL << 53);
+}
+
 // Input: table byte, separator byte, then fields split at the separator: the time zone name,
 // select columns, a where text, then row_data keys and values. A one-byte key names a declared
 // column by index, so the fuzzer reaches the accepted paths without guessing names.
@@ -202,8 +210,9 @@ inline std::string CheckBusGuard(const uint8_t* data, size_t size) {
     std::string key = parts[i];
     if (key.size() == 1) key = declared[static_cast<uint8_t>(key[0]) % declared.size()];
     const std::string& value = parts[i + 1];
-    bool allowed =
-        key != "timestamp" && key != "time_zone" && value.find('\'') == std::string::npos;
+    bool allowed = key != "timestamp" && key != "time_zone" &&
+                   value.find('\'') == std::string::npos &&
+                   (key != "_id" || CallerRowIdAllowed(value));
     bool known = false;
     for (const std::string& column : declared) known = known || column == key;
     BusRowLists before = lists;
@@ -216,6 +225,8 @@ inline std::string CheckBusGuard(const uint8_t* data, size_t size) {
     }
     acceptedKeys.push_back(key);
     acceptedValues.push_back("'" + value + "'");
+    if (value.find(',') != std::string::npos && !lists.valueHasComma)
+      return "a comma in a value went unnoticed";
     if (key == "app_id") appId = value;
     if (key == "feature") feature = value;
   }

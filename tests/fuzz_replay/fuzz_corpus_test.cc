@@ -7,6 +7,7 @@
 #include <iterator>
 #include <string>
 
+#include "fuzz/bus_statement_checks.h"
 #include "fuzz/fuzz_checks.h"
 #include "providers/survey_log_providers.h"
 
@@ -21,6 +22,7 @@ TEST(FuzzCorpusTest, EveryCorpusFileKeepsItsTargetsProperties) {
   } kTargets[] = {
       {"row_splitter", fuzz_checks::CheckRowSplitter},
       {"bus_guard", fuzz_checks::CheckBusGuard},
+      {"bus_statement", fuzz_checks::CheckBusStatement},
       {"vconf_store", fuzz_checks::CheckVconfStore},
   };
   const fs::path root = fs::path(__FILE__).parent_path().parent_path() / "fuzz" / "corpus";

@@ -1,0 +1,15 @@
+// libFuzzer entry: a bus request's where or column text on a real connection; any property
+// broken by an input ends the run with what broke.
+#include <stdio.h>
+#include <stdlib.h>
+
+#include "fuzz/bus_statement_checks.h"
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  std::string failed = fuzz_checks::CheckBusStatement(data, size);
+  if (!failed.empty()) {
+    fprintf(stderr, "property broken: %s\n", failed.c_str());
+    abort();
+  }
+  return 0;
+}
