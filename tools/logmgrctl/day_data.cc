@@ -16,6 +16,7 @@
 #include "outbox_view.h"
 #include "system_info.h"
 #include "table_view.h"
+#include "telephony.h"
 
 namespace daypage {
 
@@ -136,6 +137,22 @@ void AddRecord(int64_t dayStart, RawRecord raw, std::vector<Record>* out, Identi
   if (!RecordDay(raw.record.activity, date, &recordDay) || recordDay != dayStart) return;
   FillIdentity(raw.pairs, dayIdentity);
   out->push_back(std::move(raw.record));
+}
+
+// The SIM operator as the daemon's next report will read it: MCC, then a 2- or 3-digit MNC.
+void SimFromModem(Identity* id) {
+  telephony_handle_list_s list{0, nullptr};
+  if (telephony_init(&list) != TELEPHONY_ERROR_NONE) return;
+  char* text = nullptr;
+  if (list.count > 0 && telephony_sim_get_operator(list.handle[0], &text) == TELEPHONY_ERROR_NONE) {
+    std::string op = text != nullptr ? text : "";
+    if (op.size() == 5 || op.size() == 6) {
+      id->mcc = op.substr(0, 3);
+      id->mnc = op.substr(3);
+    }
+  }
+  free(text);
+  (void)telephony_deinit(&list);
 }
 
 std::string StampText(int64_t utcMs, const std::string& zone) {
@@ -361,6 +378,7 @@ class DayLoader {
                                   {&id->mnc, &anyIdentity_.mnc}}) {
       if (slot->empty()) *slot = *fallback;
     }
+    if (id->mcc.empty() || id->mnc.empty()) SimFromModem(id);
     // Without any record, the device's own files still name the model and the build.
     for (auto [slot, key] : {std::pair{&id->model, SYSTEM_INFO_KEY_MODEL},
                              {&id->firmware, SYSTEM_INFO_KEY_BUILD_STRING}}) {
