@@ -8,10 +8,10 @@
 
 #include "base_log_provider.h"
 #include "log_manager.h"
-#include "reporting/local_midnight.h"
 #include "provider_registry.h"
-#include "sql_literal.h"
+#include "reporting/local_midnight.h"
 #include "reporting/row_splitter.h"
+#include "sql_literal.h"
 #include "storage/pref_store.h"
 
 namespace _CorvaneLogManager {
@@ -41,21 +41,41 @@ constexpr char kDateFormat[] = "%Y-%m-%dT%H:%M:%S%z";
 constexpr char kSeparator[] = "\xC2\xB6";  // "¶"
 constexpr char kRecordColumns[] = "svc_code,category_code,activity,log_type,app_version,body";
 constexpr char kDefaultVersion[] = "99.02.00";
-constexpr size_t kValuesSize = 800;  // keeps the queue's 1024-byte insert statement whole
+// The queue provider's insert statement is 1024 bytes; the values text gets what its fixed
+// parts leave, the timestamp counted at its widest, so the statement is never cut.
+constexpr size_t kInsertStatementSize = 1024;
+constexpr size_t kValuesSize = kInsertStatementSize - (sizeof("INSERT INTO survey_log(") - 1) -
+                               (sizeof(kRecordColumns) - 1) - (sizeof(",timestamp) VALUES (") - 1) -
+                               (sizeof(",-9223372036854775808);") - 1);
 constexpr int kTallyExtra = 30;
+
+// The slice sums. SUM fails the whole select once two values overflow 64 bits, which would
+// cost the window's other records and block the day; TOTAL never fails. An all-integer group
+// gets its total back as an integer, CAST saturating at the 64-bit limits (exact while the
+// sum stays within 2^53, which any real duration or count does); a group holding other values
+// gets TOTAL's float, as SUM would give it, and an all-NULL group stays NULL.
+// clang-format off
+#define LOGMGR_CLAMPED_SUM(col)                                                              \
+  "CASE WHEN COUNT(" col ")=0 THEN NULL WHEN MAX(typeof(" col ") NOT IN ('integer','null')) " \
+  "THEN TOTAL(" col ") ELSE CAST(TOTAL(" col ") AS INTEGER) END"
 
 // In the order the day is processed.
 const Aggregation kAggregations[] = {
     {"use_app_survey", "001", "timestamp,app_id,duration", {"app_id", "duration", nullptr}, true,
-     " , COUNT(1), SUM(duration)", "app_id", "3", 8, 3, true, " , COUNT(1)", "timestamp", "0"},
+     " , COUNT(1), " LOGMGR_CLAMPED_SUM("duration"), "app_id", "3", 8, 3, true, " , COUNT(1)",
+     "timestamp", "0"},
     {"manage_app_survey", "003", "timestamp,installed_app_id,type", {"app_id", "type", nullptr},
      false, "", nullptr, "", 0, 0, false, "", nullptr, ""},
     {"report_app_error_survey", "004", "timestamp,app_id,type", {"app_id", "type", nullptr}, true,
      " , COUNT(1)", "app_id,type", "24", 1, 24, false, " , COUNT(1)", "timestamp", "0"},
     {"use_app_feature_survey", "002", "timestamp,app_id,feature,extra,value",
-     {"app_id", "feature", "extra", "value", nullptr}, true, " , COUNT(1), SUM(value)",
-     "app_id,feature,extra", "3", 8, 3, true, " , COUNT(1)", "timestamp", "0"},
+     {"app_id", "feature", "extra", "value", nullptr}, true,
+     " , COUNT(1), " LOGMGR_CLAMPED_SUM("value"), "app_id,feature,extra", "3", 8, 3, true,
+     " , COUNT(1)", "timestamp", "0"},
 };
+// clang-format on
+
+#undef LOGMGR_CLAMPED_SUM
 
 bool g_sliceMode = true;
 
@@ -169,7 +189,7 @@ void ReportBuilder::ComputeWindow(time_t day, int mode, int offsetHours, int len
 
 int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
   bool slice = g_sliceMode && agg.sliceWindows > 0;
-  char columns[200];
+  char columns[320];
   snprintf(columns, sizeof(columns), "%s%s", agg.columns,
            slice ? agg.sliceAggregate : agg.plainAggregate);
   const char* group = slice ? agg.sliceGroup : agg.plainGroup;
@@ -188,9 +208,9 @@ int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
     if (provider == nullptr) return -1;
     int rowCount = 0;
     char** rows = nullptr;
-    int selected = agg.grouped
-                       ? provider->SelectGroupedRows(columns, where, nullptr, group, &rowCount, &rows)
-                       : provider->SelectRows(columns, where, nullptr, &rowCount, &rows);
+    int selected =
+        agg.grouped ? provider->SelectGroupedRows(columns, where, nullptr, group, &rowCount, &rows)
+                    : provider->SelectRows(columns, where, nullptr, &rowCount, &rows);
     if (selected != 0) {
       FreeRows(rows, rowCount);
       return -1;
@@ -251,8 +271,8 @@ int ReportBuilder::WriteSummary(const char* renderedDay) {
   char body[kBodySize];
   size_t len = BeginBody(body, sizeof(body), renderedDay);
   AppendF(body, sizeof(body), &len, "size_001=%d%ssize_002=%d%ssize_003=%d%ssize_004=%d",
-           sizeTally["001"], kSeparator, sizeTally["002"], kSeparator, sizeTally["003"],
-           kSeparator, sizeTally["004"]);
+          sizeTally["001"], kSeparator, sizeTally["002"], kSeparator, sizeTally["003"], kSeparator,
+          sizeTally["004"]);
   return WriteRecord("007", body);
 }
 
@@ -262,11 +282,23 @@ int ReportBuilder::WriteRecord(const char* activity, const char* body) {
   (void)AppendQuoted(values, sizeof(values), DeviceText(AppVersion()).c_str());
   size_t used = strlen(values);
   snprintf(values + used, sizeof(values) - used, "','");
-  // One byte kept back for the closing quote.
-  size_t stored = AppendQuoted(values, sizeof(values) - 1, body);
+  // The body is stored whole when the statement holds it, else up to the last whole UTF-8
+  // character that fits (one byte kept back for the closing quote).
+  used = strlen(values);
+  size_t fits = AppendQuoted(values, sizeof(values) - 1, body);
+  size_t cut = fits;
+  while (cut > 0 && body[cut] != '\0' && (static_cast<unsigned char>(body[cut]) & 0xC0) == 0x80) {
+    --cut;
+  }
+  if (cut != fits) {
+    values[used] = '\0';
+    std::string head(body, cut);
+    (void)AppendQuoted(values, sizeof(values) - 1, head.c_str());
+  }
   used = strlen(values);
   snprintf(values + used, sizeof(values) - used, "'");
-  sizeTally[activity] += static_cast<int32_t>(stored) + kTallyExtra;
+  // The summary counts what the day produced, stored or not.
+  sizeTally[activity] += static_cast<int32_t>(strlen(body)) + kTallyExtra;
 
   BaseLogProvider* queue = ProviderRegistry::GetInstance()->Lookup("server_upload");
   if (queue == nullptr) return -1;

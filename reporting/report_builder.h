@@ -6,8 +6,18 @@
 // (its surplus tail is dropped); no queued text ever holds a ",", which keeps the uploader's
 // split of the queue row aligned. A "'" is carried verbatim (doubled inside the insert
 // statement), so it can neither break the day's inserts nor leak into another record. Device
-// texts (model, firmware) have any "," replaced by ";". A body longer than the record buffer is
-// cut, never overflowing the insert statement.
+// texts (model, firmware) have any "," replaced by ";".
+//
+// Bodies: built whole (up to kBodySize - 1 bytes) and stored whole when the queue's 1024-byte
+// insert statement holds them; a longer one is stored up to its last whole UTF-8 character that
+// fits, so the insert never fails for size. The day's summary adds each body's full length
+// plus 30, stored or not.
+//
+// Sums: the slice records' sum of duration or value is TOTAL, given back as an integer when all
+// of the group's values are integers, saturating at the 64-bit limits instead of failing (SUM's
+// integer overflow would end the window's select in an error, lose the day's other records
+// and block the day for good). Below 2^53 it equals SUM exactly; a group with a non-integer
+// value gets the float SUM gives, and an all-NULL group stays empty.
 #ifndef LOGMGR_REPORTING_REPORT_BUILDER_H_
 #define LOGMGR_REPORTING_REPORT_BUILDER_H_
 
@@ -30,7 +40,7 @@ int64_t SystemClockMs();
 
 class ReportBuilder {
  public:
-  static constexpr size_t kBodySize = 640;
+  static constexpr size_t kBodySize = 4096;
   static constexpr size_t kDateSize = 80;
 
   ReportBuilder() = default;

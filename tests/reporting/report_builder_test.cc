@@ -28,8 +28,8 @@ class ReportBuilderTest : public ReportingTest {
                      std::to_string(stamp) + "," + values + ");");
   }
   std::vector<std::string> Bodies(const std::string& activity) {
-    return Column(upload, "SELECT body FROM survey_log WHERE activity='" + activity +
-                              "' ORDER BY _id");
+    return Column(upload,
+                  "SELECT body FROM survey_log WHERE activity='" + activity + "' ORDER BY _id");
   }
 
   ReportBuilder builder;
@@ -43,15 +43,15 @@ TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
   Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 2, 30), "'a.calc',500");
   Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 2), "'b.mail',200");
   Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 22), "'a.calc',300");
-  Row(useApp, "app_id,duration", LocalMs(2024, 6, 10, 22), "'old.day',1");   // purged unsent
+  Row(useApp, "app_id,duration", LocalMs(2024, 6, 10, 22), "'old.day',1");        // purged unsent
   Row(useApp, "app_id,duration", LocalMs(2024, 6, 12, 0, 0, 0, 1), "'today',1");  // kept
-  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 11, 10, 15, 30),
-      "'c.game',1");
+  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 11, 10, 15, 30), "'c.game',1");
   Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 8), "'a.calc',2");
   Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 9), "'a.calc',2");
   Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 12), "'b.mail',1");
   Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 13), "'lm','SCRN','',4000");
-  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 14, 59, 59), "'lm','SCRN','',1000");
+  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 14, 59, 59),
+      "'lm','SCRN','',1000");
   Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 15), "'lm','WIFI','',10");
 
   ASSERT_EQ(builder.RunDaily(), 0);
@@ -66,7 +66,8 @@ TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
       kHead + "date=2024-06-12T00:00:00+0200¶sum=24¶count=2¶app_id=a.calc¶type=2",
       kHead + "date=2024-06-12T00:00:00+0200¶sum=24¶count=1¶app_id=b.mail¶type=1"};
   const std::vector<std::string> features = {
-      kHead + "date=2024-06-11T15:00:00+0200¶sum=3¶count=2¶app_id=lm¶feature=SCRN¶extra=¶value=5000",
+      kHead +
+          "date=2024-06-11T15:00:00+0200¶sum=3¶count=2¶app_id=lm¶feature=SCRN¶extra=¶value=5000",
       kHead + "date=2024-06-11T18:00:00+0200¶sum=3¶count=1¶app_id=lm¶feature=WIFI¶extra=¶value=10"};
   EXPECT_EQ(Bodies("001"), use);
   EXPECT_EQ(Bodies("003"), manage);
@@ -78,15 +79,16 @@ TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
     for (const std::string& body : bodies) size += body.size() + 30;
     return std::to_string(size);
   };
-  EXPECT_EQ(Bodies("007"), std::vector<std::string>{kHead + "date=2024-06-11T00:00:00+0200¶size_001=" +
-                                                    tally(use) + "¶size_002=" + tally(features) +
-                                                    "¶size_003=" + tally(manage) + "¶size_004=" +
-                                                    tally(errors)});
+  EXPECT_EQ(Bodies("007"),
+            std::vector<std::string>{kHead + "date=2024-06-11T00:00:00+0200¶size_001=" +
+                                     tally(use) + "¶size_002=" + tally(features) +
+                                     "¶size_003=" + tally(manage) + "¶size_004=" + tally(errors)});
   // Insertion order is the day's processing order; the fixed columns of every record.
   EXPECT_EQ(Column(upload, "SELECT group_concat(activity, ' ') FROM survey_log"),
             std::vector<std::string>{"001 001 001 003 004 004 002 002 007"});
-  EXPECT_EQ(Column(upload, "SELECT DISTINCT svc_code||category_code||log_type||app_version "
-                           "FROM survey_log"),
+  EXPECT_EQ(Column(upload,
+                   "SELECT DISTINCT svc_code||category_code||log_type||app_version "
+                   "FROM survey_log"),
             std::vector<std::string>{"701999BIZW2.3-K9"});
 
   // The day and everything before it is gone; today's row waits.
@@ -112,13 +114,14 @@ TEST_F(ReportBuilderTest, ThreeDaysBackAreProcessedOldestFirst) {
   ASSERT_EQ(builder.RunDaily(), 0);
 
   std::vector<std::string> summaryDates;
-  for (const std::string& body : Bodies("007")) summaryDates.push_back(body.substr(kHead.size(), 29));
+  for (const std::string& body : Bodies("007"))
+    summaryDates.push_back(body.substr(kHead.size(), 29));
   EXPECT_EQ(summaryDates, (std::vector<std::string>{"date=2024-06-09T00:00:00+0200",
                                                     "date=2024-06-10T00:00:00+0200",
                                                     "date=2024-06-11T00:00:00+0200"}));
-  EXPECT_EQ(Bodies("003"),
-            (std::vector<std::string>{kHead + "date=2024-06-09T12:00:00+0200¶app_id=m.one¶type=0",
-                                      kHead + "date=2024-06-10T12:00:00+0200¶app_id=m.two¶type=0"}));
+  EXPECT_EQ(Bodies("003"), (std::vector<std::string>{
+                               kHead + "date=2024-06-09T12:00:00+0200¶app_id=m.one¶type=0",
+                               kHead + "date=2024-06-10T12:00:00+0200¶app_id=m.two¶type=0"}));
   EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
 }
 
@@ -140,7 +143,8 @@ TEST_F(ReportBuilderTest, ManageRowInTheLastSecondIsDroppedUnreportedByTheNextDa
   Now(2024, 6, 11, 10);
   ASSERT_EQ(builder.RunDaily(), 0);
   EXPECT_TRUE(Bodies("003").empty());
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"), std::vector<std::string>{"0"});
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"),
+            std::vector<std::string>{"0"});
 }
 
 TEST_F(ReportBuilderTest, QuotesAndCommasFromOutsideCallersStayInTheirOwnRecord) {
@@ -170,6 +174,104 @@ TEST_F(ReportBuilderTest, QuotesAndCommasFromOutsideCallersStayInTheirOwnRecord)
   EXPECT_EQ(Bodies("007").size(), 1u);
 }
 
+TEST_F(ReportBuilderTest, SumsPastTheIntegerLimitSaturateAndCostNoOtherRecord) {
+  Now(2024, 6, 12, 10);
+  SentDate(2024, 6, 10);
+  const std::string feature = "use_app_feature_survey";
+  const int64_t t = LocalMs(2024, 6, 11, 1);
+  // Eighteen digits: each value still renders whole; ten of them pass 2^63.
+  for (int i = 0; i < 10; ++i)
+    Row("use_app_survey", "app_id,duration", t, "'big',999999999999999999");
+  Row("use_app_survey", "app_id,duration", t, "'a.calc',1000");
+  Row("use_app_survey", "app_id,duration", t, "'a.calc',500");
+  Row(feature, "app_id,feature,extra,value", t, "'x','HALF','',1.5");
+  Row(feature, "app_id,feature,extra,value", t, "'x','HALF','',1");
+  Row(feature, "app_id,feature,extra,value", t, "'x','NONE','',NULL");
+  Row(feature, "app_id,feature,extra,value", t, "'x','NEG','',-7");
+  Row(feature, "app_id,feature,extra,value", t, "'lm','SCRN','',4000");
+
+  ASSERT_EQ(builder.RunDaily(), 0);
+
+  const std::string date = "date=2024-06-11T03:00:00+0200¶sum=3¶";
+  EXPECT_EQ(Bodies("001"), (std::vector<std::string>{
+                               kHead + date + "count=2¶app_id=a.calc¶duration=1500",
+                               kHead + date + "count=10¶app_id=big¶duration=9223372036854775807"}));
+  // Below the limit every sum reads as SUM gives it: integers exact, a float as a float, an
+  // all-NULL group as nothing (so, as ever, the NULL value shifts that record's count).
+  EXPECT_EQ(Bodies("002"), (std::vector<std::string>{
+                               kHead + date + "count=1¶app_id=lm¶feature=SCRN¶extra=¶value=4000",
+                               kHead + date + "count=2¶app_id=x¶feature=HALF¶extra=¶value=2.500000",
+                               kHead + date + "count=1¶app_id=x¶feature=NEG¶extra=¶value=-7",
+                               kHead + date + "count=¶app_id=x¶feature=NONE¶extra=¶value="}));
+  EXPECT_EQ(Bodies("007").size(), 1u);
+  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
+}
+
+TEST_F(ReportBuilderTest, ATableWhoseSelectFailsKeepsItsRowsAndTheDayStaysDue) {
+  Now(2024, 6, 12, 10);
+  SentDate(2024, 6, 10);
+  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'a.calc',1000");
+  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 1),
+      "'lm','SCRN','',4000");
+  // Another connection changes the schema under the daemon's, so the feature select fails.
+  auto alter = [&](const char* sql) {
+    sqlite3* other = nullptr;
+    ASSERT_EQ(sqlite3_open((sysroot + "/opt/usr/dbspace/.SurveyLog.db").c_str(), &other),
+              SQLITE_OK);
+    EXPECT_EQ(sqlite3_exec(other, sql, nullptr, nullptr, nullptr), SQLITE_OK) << sql;
+    sqlite3_close(other);
+  };
+  alter("ALTER TABLE use_app_feature_survey RENAME COLUMN extra TO gone");
+
+  EXPECT_EQ(builder.RunDaily(), -1);
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_feature_survey"),
+            std::vector<std::string>{"1"});
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_survey"), std::vector<std::string>{"0"});
+  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 10) / 1000);
+
+  // The repeat completes the day; the purged table's record is not queued again.
+  alter("ALTER TABLE use_app_feature_survey RENAME COLUMN gone TO extra");
+  ASSERT_EQ(builder.RunDaily(), 0);
+  EXPECT_EQ(Bodies("001").size(), 1u);
+  EXPECT_EQ(Bodies("002").size(), 1u);
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_feature_survey"),
+            std::vector<std::string>{"0"});
+}
+
+TEST_F(ReportBuilderTest, LongBodiesAreStoredWholeOrCutAtACharacterAndTalliedInFull) {
+  Now(2024, 6, 12, 10);
+  SentDate(2024, 6, 10);
+  const std::string longFeature(290, 'f'), longExtra(290, 'e'), marks = [] {
+    std::string text;
+    for (int i = 0; i < 149; ++i) text += "¶";  // two bytes each
+    return text;
+  }();
+  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 1),
+      "'lm','" + longFeature + "','" + longExtra + "',1");
+  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 4),
+      "'" + longExtra + "','" + longFeature + "','" + marks + "',2");
+
+  ASSERT_EQ(builder.RunDaily(), 0);
+
+  const std::string whole =
+      kHead + "date=2024-06-11T03:00:00+0200¶sum=3¶count=1¶app_id=lm¶feature=" + longFeature +
+      "¶extra=" + longExtra + "¶value=1";
+  const std::string tooLong = kHead +
+                              "date=2024-06-11T06:00:00+0200¶sum=3¶count=1¶app_id=" + longExtra +
+                              "¶feature=" + longFeature + "¶extra=" + marks + "¶value=2";
+  std::vector<std::string> stored = Bodies("002");
+  ASSERT_EQ(stored.size(), 2u);
+  EXPECT_GT(whole.size(), 639u);
+  EXPECT_EQ(stored[0], whole);
+  // Cut where the 1024-byte insert statement ends, never inside a two-byte character.
+  EXPECT_GT(stored[1].size(), 800u);
+  EXPECT_LT(stored[1].size(), tooLong.size());
+  EXPECT_EQ(tooLong.compare(0, stored[1].size(), stored[1]), 0);
+  EXPECT_NE(static_cast<unsigned char>(stored[1].back()), 0xC2);
+  const std::string size002 = "size_002=" + std::to_string(whole.size() + tooLong.size() + 60);
+  EXPECT_NE(Bodies("007")[0].find(size002), std::string::npos) << Bodies("007")[0];
+}
+
 TEST_F(ReportBuilderTest, WindowsTileTheDayAcrossSummerTime) {
   struct Case {
     int month, day, mode, offset, length;
@@ -193,4 +295,3 @@ TEST_F(ReportBuilderTest, WindowsTileTheDayAcrossSummerTime) {
 
 }  // namespace
 }  // namespace _CorvaneLogManager
-
