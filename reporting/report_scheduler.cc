@@ -58,7 +58,8 @@ PrefStore* Prefs() {
 void RenderDate(time_t when) {
   char text[80];
   struct tm tm;
-  if (localtime_r(&when, &tm) != nullptr) (void)strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%S%z", &tm);
+  if (localtime_r(&when, &tm) != nullptr)
+    (void)strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%S%z", &tm);
 }
 
 int OnAlarm(alarm_id_t id, void*) {
@@ -128,6 +129,7 @@ int ReportScheduler::Create() {
   alarmId = 0;
   running = false;
   worker = 0;
+  workerStarted = false;
   reportPair = ReportPair::Get();
   return reportPair != nullptr ? 0 : -1;
 }
@@ -179,15 +181,22 @@ void ReportScheduler::Stop() {
     alarmId = 0;
   }
   alarmmgr_fini();
-  if (running && worker != 0 && pthread_cancel(worker) == 0) {
+  if (running.load() && workerStarted && pthread_cancel(worker) == 0) {
     // The worker may sit inside a statement with cancellation off: interrupting both
     // connections makes that statement fail, and the worker ends itself there.
     UploadDbManager* upload = UploadDbManager::GetInstance();
-    if (upload != nullptr && upload->GetConnection() != nullptr) upload->GetConnection()->Interrupt();
+    if (upload != nullptr && upload->GetConnection() != nullptr)
+      upload->GetConnection()->Interrupt();
     DbManager* survey = DbManager::GetInstance();
-    if (survey != nullptr && survey->GetConnection() != nullptr) survey->GetConnection()->Interrupt();
+    if (survey != nullptr && survey->GetConnection() != nullptr)
+      survey->GetConnection()->Interrupt();
+  }
+  // Also a finished worker: it may still be re-checking consent, and the pair, the
+  // connections and LogManager go away right after this.
+  if (workerStarted) {
     int err = pthread_join(worker, nullptr);
     if (err != 0) (void)strerror(err);  // nothing is logged
+    workerStarted = false;
   }
   ReportPair::Destroy();
   reportPair = nullptr;
@@ -196,11 +205,16 @@ void ReportScheduler::Stop() {
 }
 
 void ReportScheduler::HandleEvent(int kind) {
-  if (running || kind < 0 || kind > kAlarm) return;
+  if (running.load() || kind < 0 || kind > kAlarm) return;
   switch (kind) {
-    case kDumpContext: DumpContext(); break;
-    case kTimeChanged: ResetAfterTimeChange(); break;
-    default: break;
+    case kDumpContext:
+      DumpContext();
+      break;
+    case kTimeChanged:
+      ResetAfterTimeChange();
+      break;
+    default:
+      break;
   }
   CheckReportDue();
 }
@@ -233,11 +247,20 @@ void ReportScheduler::CheckReportDue() {
   if (reportPair != nullptr && reportPair->builder != nullptr) yesterday = MidnightDaysAgo(1);
   if (yesterday == sent) return;
 
+  JoinFinishedWorker();
   running = true;
   CheckWeeklyStatusCopy();
   int err = pthread_create(&worker, nullptr, WorkerEntry, this);
+  workerStarted = err == 0;
   // Running deliberately stays set on failure: no further run until a restart.
   if (err != 0) (void)strerror(err);
+}
+
+void ReportScheduler::JoinFinishedWorker() {
+  // Only called with running false: the worker is past its run and ends within moments.
+  if (!workerStarted) return;
+  (void)pthread_join(worker, nullptr);
+  workerStarted = false;
 }
 
 int ReportScheduler::RunJob() {
@@ -337,7 +360,8 @@ void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
 
 void ReportScheduler::AddSdCardRow() {
   ProviderRegistry* registry = ProviderRegistry::GetInstance();
-  BaseLogProvider* feature = registry != nullptr ? registry->Lookup("use_app_feature_survey") : nullptr;
+  BaseLogProvider* feature =
+      registry != nullptr ? registry->Lookup("use_app_feature_survey") : nullptr;
   if (feature == nullptr) return;
   int mmc = 0;
   if (vconf_get_int(kMmcKey, &mmc) != 0) return;

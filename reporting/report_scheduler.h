@@ -7,6 +7,8 @@
 #include <pthread.h>
 #include <time.h>
 
+#include <atomic>
+
 namespace _CorvaneLogManager {
 
 class ReportBuilder;
@@ -38,8 +40,10 @@ class ReportScheduler {
   // The job body run on the worker: report and upload, weekly purge, running cleared.
   // -1 when there is no report pair.
   int RunJob();
-  // True from the moment a run is decided until the worker has finished it.
-  bool IsRunning() const { return running; }
+  // True from the moment a run is decided until the worker has finished it. Read by the main
+  // loop, cleared by the worker: the flag hands the PrefStore dates and the report pair from
+  // one thread to the other, so it is sequentially consistent.
+  bool IsRunning() const { return running.load(); }
   alarm_id_t AlarmId() const { return alarmId; }
 
   // Brings key_sent_date into range: on first start midnight yesterday; otherwise never more
@@ -66,12 +70,15 @@ class ReportScheduler {
   void CopyStatusSnapshot(long lowerBound);
   void AddSdCardRow();
   void CheckWeeklyPurge();
+  // Joins a worker that has finished its run (running is false), so no thread is left behind.
+  void JoinFinishedWorker();
 
   alarm_entry_t* alarmEntry = nullptr;
   alarm_id_t alarmId = 0;
   ReportPair* reportPair = nullptr;
-  bool running = false;
+  std::atomic<bool> running{false};
   pthread_t worker = 0;
+  bool workerStarted = false;  // main loop only: a worker exists that nobody joined yet
 };
 
 }  // namespace _CorvaneLogManager
