@@ -66,6 +66,9 @@ int64_t Uploader::NowMs() const { return clockFn != nullptr ? clockFn() : System
 void Uploader::SendAll() {
   if (builder == nullptr || queue == nullptr || !GetRuntimeSwitch(1)) return;
   PurgeOutOfWindow();
+  // A record marked by a send that was cut short (a kill between mark and delete) was handed
+  // over already: it goes now instead of being handed over again.
+  DeleteSent();
   SendBatch(kBatchLimit);
   DeleteSent();
 }

@@ -29,8 +29,8 @@ class Uploader {
   // Takes the report pair's builder (-1 when null) and makes the own queue provider
   // (-1 when that allocation fails). 0 on success.
   int Init(ReportBuilder* reportBuilder);
-  // Purge out-of-window records, hand over one batch, delete what was handed over. Runs only
-  // with a builder and runtime switch 1 on.
+  // Purge out-of-window records and those a cut-short send marked, hand over one batch,
+  // delete what was handed over. Runs only with a builder and runtime switch 1 on.
   void SendAll();
 
   // The row splitter: nine field pointers per row, cut in place; null when allocation fails.

@@ -107,6 +107,18 @@ TEST_F(UploaderTest, OutOfWindowRecordsArePurgedUnsent) {
   EXPECT_EQ(OutboxLines().size(), 3u);
 }
 
+TEST_F(UploaderTest, ARecordMarkedByASendCutShortGoesWithoutBeingHandedOverAgain) {
+  Queue("001", g_testNowMs, "taken before the kill");
+  Queue("001", g_testNowMs, "not reached");
+  Exec(upload, "UPDATE survey_log SET rly_result='success' WHERE body='taken before the kill';");
+
+  uploader.SendAll();
+
+  ASSERT_EQ(OutboxLines().size(), 1u);
+  EXPECT_NE(OutboxLines()[0].find("not reached"), std::string::npos);
+  EXPECT_EQ(Column(upload, "SELECT count(*) FROM survey_log"), std::vector<std::string>{"0"});
+}
+
 // The relay's fault counters are per process, so each case runs in a fresh child process.
 TEST_F(UploaderTest, RelayFailureOnTheThirdRecordKeepsTheRestQueued) {
   GTEST_FLAG_SET(death_test_style, "threadsafe");
