@@ -4,8 +4,10 @@ import json
 import os
 import signal
 import sqlite3
+import threading
 import time
 
+import bus_client
 from harness import DeviceTestCase, wait_for
 
 SURVEY_DB = ".SurveyLog.db"
@@ -167,6 +169,41 @@ class ReportCycleTest(DeviceTestCase):
                          [(4000,)])
         self.assertEqual(self.pref("key_sent_date"), midnight(2))
         self.assertLess(self.dev.query(UPLOAD_DB, "SELECT count(*) FROM survey_log")[0][0], 4000)
+
+    def test_a_caller_busy_on_the_bus_during_a_run_costs_no_record_and_no_repeat(self):
+        # Statements of the worker and of bus requests share one connection; a request's checks
+        # once judged the worker's statements too, failing its purge mid-day.
+        self.prepared_device()
+        self.set_pref("key_sent_date", midnight(4))
+        for days_ago in (3, 2, 1):
+            self.seed_use_app(midnight(days_ago), 8600, apps=20)  # all eight slices
+        self.dev.start_daemon()
+        stop = threading.Event()
+
+        def caller():
+            proxy = None
+            while not stop.is_set():
+                try:
+                    proxy = proxy or bus_client.table_proxy(self.dev, bus_client.FEATURE)
+                    proxy.Insert({"app_id": "busy", "feature": "LOAD", "value": "1"})
+                except Exception:  # before the daemon serves the table
+                    proxy = None
+                    stop.wait(0.01)
+        threads = [threading.Thread(target=caller) for _ in range(4)]
+        for thread in threads:
+            thread.start()
+        try:
+            wait_for(lambda: len(self.summaries()) == 3 and self.dev.query(
+                UPLOAD_DB, "SELECT count(*) FROM survey_log") == [(0,)], timeout=30,
+                     message="three days handed over")
+        finally:
+            stop.set()
+            for thread in threads:
+                thread.join()
+        uses = [i["7"] for i in self.outbox() if i["4"] == "001"]
+        self.assertEqual(len(uses), 3 * 8 * 20)
+        self.assertEqual(len(set(uses)), len(uses))
+        self.assertEqual(self.dev.query(SURVEY_DB, "SELECT count(*) FROM use_app_survey"), [(0,)])
 
     def test_sums_past_the_integer_limit_cost_no_other_record_of_the_day(self):
         self.prepared_device()
