@@ -81,7 +81,8 @@ class DbConnection {
   // has room for Count(table) rows; with a row count above 0 the caller frees each row and
   // the array (delete[]); with 0 nothing is left to free.
   int Select(const char* sql, const char* table, int* rowCount, char*** rows);
-  // Low 32 bits of the last insert row id; -1 when closed.
+  // Low 32 bits of the last insert row id; -1 when closed. Both are those of the calling
+  // thread's last Exec on this connection, whatever another thread ran since.
   int LastInsertRowId();
   // Rows changed by the last statement; -1 when closed.
   int Changes();

@@ -21,6 +21,14 @@ namespace _CorvaneLogManager {
 
 namespace {
 
+// What the calling thread's last Exec changed, on which connection.
+struct LastExec {
+  const void* conn;
+  int changes;
+  int64_t rowId;
+};
+thread_local LastExec t_lastExec = {nullptr, 0, 0};
+
 bool g_encryption = false;
 
 // VM steps between stop-flag checks: small enough that a long scan stops within microseconds.
@@ -263,8 +271,15 @@ int DbConnection::Exec(const char* sql) {
   // Deliberately left non-cancellable after a failed statement, a refused text included.
   if (!PrepareOrFail(sql, &stmt, false)) return -1;
   int rc;
+  // The report worker and the main loop share the connection: the counts a caller reads
+  // after its statement are taken under the connection's mutex, before the other thread's
+  // next statement can change them.
+  sqlite3_mutex* mutex = sqlite3_db_mutex(db);
+  sqlite3_mutex_enter(mutex);
   while ((rc = sqlite3_step(stmt)) == SQLITE_ROW) {
   }
+  t_lastExec = {this, sqlite3_changes(db), sqlite3_last_insert_rowid(db)};
+  sqlite3_mutex_leave(mutex);
   if (rc == SQLITE_INTERRUPT) {
     EndThreadUnlessBudgetSpent(stmt);
     return -1;
@@ -427,10 +442,14 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
 
 int DbConnection::LastInsertRowId() {
   if (db == nullptr) return -1;
-  return static_cast<int>(static_cast<uint32_t>(sqlite3_last_insert_rowid(db)));
+  int64_t id = t_lastExec.conn == this ? t_lastExec.rowId : sqlite3_last_insert_rowid(db);
+  return static_cast<int>(static_cast<uint32_t>(id));
 }
 
-int DbConnection::Changes() { return db == nullptr ? -1 : sqlite3_changes(db); }
+int DbConnection::Changes() {
+  if (db == nullptr) return -1;
+  return t_lastExec.conn == this ? t_lastExec.changes : sqlite3_changes(db);
+}
 
 void DbConnection::Interrupt() {
   if (db == nullptr) return;

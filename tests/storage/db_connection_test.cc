@@ -10,6 +10,7 @@
 
 #include <atomic>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "storage/key_derivation.h"
@@ -458,6 +459,36 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   ReleaseKeyParams();
   unsetenv("LOGMGR_SYSROOT");
   (void)system(("rm -rf '" + root + "'").c_str());
+}
+
+}  // namespace
+}  // namespace _CorvaneLogManager
+
+namespace _CorvaneLogManager {
+namespace {
+
+// The report worker purges batches on the connection the main loop's bus requests use: a
+// request's count is its own statement's, whatever the other thread ran in between.
+TEST_F(DbConnectionTest, CountsAreThoseOfTheCallingThreadsOwnStatement) {
+  Setup({"CREATE TABLE mine(v);", "CREATE TABLE batch(v);"});
+  std::atomic<bool> stop{false};
+  std::thread other([&] {
+    while (!stop.load()) {
+      (void)conn.Exec("INSERT INTO batch VALUES (1),(2),(3),(4),(5);");
+      (void)conn.Exec("DELETE FROM batch;");
+    }
+  });
+  int wrong = 0;
+  for (int i = 0; i < 3000; ++i) {
+    if (conn.Exec("INSERT INTO mine VALUES (1);") != 0) ++wrong;
+    int id = conn.LastInsertRowId();
+    std::string del = "DELETE FROM mine WHERE rowid = " + std::to_string(id) + ";";
+    if (conn.Exec(del.c_str()) != 0 || conn.Changes() != 1) ++wrong;
+  }
+  stop = true;
+  other.join();
+  EXPECT_EQ(wrong, 0);
+  EXPECT_EQ(Select("SELECT count(*) FROM mine;", "mine"), Rows{});  // an empty table yields no row
 }
 
 }  // namespace
