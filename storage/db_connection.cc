@@ -259,9 +259,20 @@ int DbConnection::Open(const char* path) {
   (void)sqlite3_limit(handle, SQLITE_LIMIT_LENGTH, kMaxValueLength);
   // WAL with synchronous NORMAL: an event's insert costs no fsync; a power cut may drop the
   // last commits but never corrupts the file. A file that refuses it keeps its journal mode.
-  SetupScope setup(this);
-  for (const char* pragma : kJournalPragmas) (void)Exec(pragma);
+  bool readable;
+  {
+    SetupScope setup(this);
+    for (const char* pragma : kJournalPragmas) (void)Exec(pragma);
+    // SQLite opens lazily: a file that is not a database would fail every later statement.
+    // Failing the open instead leaves the connection closed, so the start is retried until
+    // the file is usable.
+    readable = Exec("SELECT count(*) FROM sqlite_master;") == 0;
+  }
   EnableCancel();  // a refused pragma leaves the thread as it found it
+  if (!readable) {
+    (void)Close();
+    return -1;
+  }
   return 0;
 }
 

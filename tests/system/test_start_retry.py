@@ -61,6 +61,22 @@ class StartRetryTest(DeviceTestCase):
         self.assertEqual(rows, [("after.obstacle",)])
         self.assert_one_row_per_crash()
 
+    def test_a_file_that_is_not_a_database_is_left_alone_and_retried_until_replaced(self):
+        path = self.dev.db_path(".SurveyLog.db")
+        garbage = b"not a database\n" * 64
+        with open(path, "wb") as f:
+            f.write(garbage)
+        self.dev.set_consent(True)
+        proc = self.dev.start_daemon()
+        self.dev.wait_started()
+        self.assertFalse(self.insert("blocked"))
+        with open(path, "rb") as f:
+            self.assertEqual(f.read(), garbage)
+        os.unlink(path)
+        wait_for(lambda: self.insert("after.obstacle"), message="a bus Insert to succeed")
+        self.assertIsNone(proc.poll())
+        self.assert_one_row_per_crash()
+
     def test_a_start_failing_after_the_monitors_began_starts_each_once(self):
         # The snapshot store fails the first attempt after the crash monitor has started;
         # the retry gets past it (the store stays, failing its operations).
