@@ -135,21 +135,21 @@ TEST_F(DbConnectionTest, CountsAndFailureValues) {
 
 TEST_F(DbConnectionTest, BadFilesAndDirectoriesFailWithoutDamage) {
   std::string junk = dir + "/junk.db";
-  ASSERT_EQ(system(("head -c 4096 /dev/urandom > '" + junk + "'").c_str()), 0);
+  ASSERT_EQ(system(("head -c 4096 /dev/urandom > '" + junk + "' && cp '" + junk + "' '" + junk +
+                     ".orig'").c_str()),
+            0);
   DbConnection bad;
-  ASSERT_EQ(bad.Open(junk.c_str()), 0) << "SQLite reads the header lazily";
-  {
-    DbConnection::SetupScope setup(&bad);
-    EXPECT_EQ(bad.Exec("CREATE TABLE IF NOT EXISTS t(x);"), -1);
-  }
+  // SQLite reads the header lazily; the open reads it at once, so the file stays closed.
+  EXPECT_EQ(bad.Open(junk.c_str()), -1);
+  EXPECT_EQ(bad.Exec("CREATE TABLE IF NOT EXISTS t(x);"), -1);
   EXPECT_EQ(bad.Count("t"), 0);
-  EXPECT_EQ(bad.TableExists("t"), 0);
-  EXPECT_EQ(bad.Close(), 0);
+  EXPECT_EQ(bad.Close(), -1);
+  EXPECT_EQ(system(("cmp -s '" + junk + "' '" + junk + ".orig'").c_str()), 0);
   DbConnection missing;
   EXPECT_EQ(missing.Open((dir + "/no/such/dir/x.db").c_str()), -1);
 
-  // A read-only directory holding a database with a row: no new file, no write (a WAL file
-  // cannot read there either). Root ignores modes, so a child drops to an unprivileged user.
+  // A read-only directory holding a database with a row: no new file, and the WAL database
+  // cannot even be read there, so the open fails. Root ignores modes, so a child drops to an unprivileged user.
   Setup({"CREATE TABLE t(x);", "INSERT INTO t VALUES('kept');"});
   ASSERT_EQ(conn.Close(), 0);
   ASSERT_EQ(chmod(path.c_str(), 0644), 0);  // made owner-only; the reader below is another user
@@ -161,10 +161,10 @@ TEST_F(DbConnectionTest, BadFilesAndDirectoriesFailWithoutDamage) {
         if (geteuid() == 0 && (setgid(65534) != 0 || setuid(65534) != 0)) _exit(10);
         DbConnection ro;
         if (ro.Open((dir + "/fresh.db").c_str()) != -1) _exit(11);
-        if (ro.Open(path.c_str()) != 0) _exit(12);
+        if (ro.Open(path.c_str()) != -1) _exit(12);
         if (ro.Exec("INSERT INTO t VALUES('lost');") != -1) _exit(13);
         if (ro.Exec("DELETE FROM t;") != -1) _exit(14);
-        _exit(ro.Close() == 0 ? 0 : 15);
+        _exit(ro.Close() == -1 ? 0 : 15);
       },
       ::testing::ExitedWithCode(0), "");
   ASSERT_EQ(chmod(dir.c_str(), 0700), 0);
