@@ -49,6 +49,9 @@ class AttackBusTest(DeviceTestCase):
         wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
                                         "WHERE name LIKE '%_survey'") == [(5,)],
                  message="the survey tables")
+        # The scheduler starts last (sent date, then the dump key): the snapshot comes after it.
+        wait_for(lambda: self.dev.vconf_get("db/corvane-log-manager/dumpcontext") is not None,
+                 message="the daemon's whole start")
         prepare_for_other_users(self.dev)
         gid = grp.getgrnam("logmgr").gr_gid
         self.attacker = ["setpriv", "--reuid=65534", "--regid=65534", f"--groups={gid}"]
