@@ -180,10 +180,10 @@ class Device:
         dest = args.pop(0)[len("--dest="):] if args[0].startswith("--dest=") else ""
         path, name = args[0], args[1]
         interface, _, member = name.rpartition(".")
-        spec = json.dumps([self.env["DBUS_SYSTEM_BUS_ADDRESS"], dest, path, interface, member,
-                           args[2:]])
+        request = json.dumps([self.env["DBUS_SYSTEM_BUS_ADDRESS"], dest, path, interface, member,
+                              args[2:]])
         return subprocess.run((NOBODY if as_nobody else []) +
-                              ["/usr/bin/python3", "-c", SIGNAL_SENDER, spec], env=self.env,
+                              ["/usr/bin/python3", "-c", SIGNAL_SENDER, request], env=self.env,
                               capture_output=True, text=True, timeout=150)
 
     def name_owner(self, name=BUS_NAME):
