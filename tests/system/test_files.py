@@ -203,7 +203,12 @@ class KeyFilesTest(FilesCase):
                                    capture_output=True, text=True, timeout=20 * TIMEOUT_SCALE)
                 self.assertEqual(r.returncode, 0, r.stderr)
                 # A key still set the ordinary way keeps working.
+                # The daemon reads a key when told of its change: the plug must be seen (its
+                # open period stored) before the unplug replaces the value.
                 self.dev.vconf_set("memory/sysman/earjack", "int", "1")
+                wait_for(lambda: self.dev.query(
+                    ".StatusMonitor.db", "SELECT 1 FROM survey_status_monitor "
+                    "WHERE feature = 'HEAD' AND timestamp > 0"), message="the headset plugged")
                 self.dev.vconf_set("memory/sysman/earjack", "int", "0")
                 wait_for(lambda: len(self.features("HEAD")) == n + 1, message="a headset row")
                 self.assertIsNone(proc.poll())
