@@ -37,7 +37,7 @@ const int kProgressSteps = 1000;
 const char kKeyLibrary[] = "/usr/lib/libsqlite3.so.0";
 // Only the open phase waits for a lock another process holds (a second daemon creating the
 // same tables at its start); the main loop's statements never wait.
-const int kSetupBusyWaitMs = 2000;
+const int kSetupBusyWaitMs = 10000;  // a start may wait; a slow or loaded device needs it
 const int kBusyPollMs = 10;
 const char* const kJournalPragmas[] = {"PRAGMA journal_mode=WAL;", "PRAGMA synchronous=NORMAL;"};
 // No value a daemon statement makes comes near this; a bus request cannot build more.

@@ -118,10 +118,10 @@ int PrefStore::Open() {
   if (connection == nullptr) return -1;
   char path[PATH_MAX];
   if (connection->Open(logmgr_fixed_path(kDbPath, path, sizeof(path))) != 0) return -1;
-  {
-    DbConnection::SetupScope setup(connection);
-    if (connection->Exec(kCreateSql) != 0) return -1;
-  }
+  // The device id's first write belongs to the open too: a second process opening the store
+  // at the same moment holds the lock briefly, and the open waits for it instead of failing.
+  DbConnection::SetupScope setup(connection);
+  if (connection->Exec(kCreateSql) != 0) return -1;
   std::string id;
   if (GetString(kDeviceIdKey, &id) != 0) return -1;
   if (id.empty()) {
