@@ -154,16 +154,22 @@ class DayPageTest(unittest.TestCase):
                  and root_watched(dev.env["DISPLAY"]), timeout=30, interval=0.2,
                  message="the daemon to watch the root window")
 
+        attempts = []
+
         def gamma_then_alpha():
-            """gamma's 1000 ms row, so that alpha's period starts now"""
+            """gamma's row of this probe's length, so that alpha's period starts now"""
+            # Its own length per probe: a late row of an earlier probe never passes for it.
+            attempts.append(1000 + len(attempts))
+            gamma = "SELECT duration FROM use_app_survey WHERE app_id='pkg.gamma' ORDER BY _id"
+            count = len(cls.rows(gamma))
             dev.devsim("app", "focus", "com.ex.gamma")
-            clock.advance_ms(1000)
+            clock.advance_ms(attempts[-1])
             dev.devsim("app", "focus", "com.ex.alpha")
             try:
-                return wait_for(lambda: ("pkg.gamma", 1000) in cls.rows(
-                    "SELECT app_id, duration FROM use_app_survey"), timeout=2)
+                rows = wait_for(lambda: cls.rows(gamma)[count:], timeout=10)
             except AssertionError:
                 return False
+            return rows[-1] == (attempts[-1],)
         cls.alpha_from = cls.at(gamma_then_alpha)
         for app, ms in (("com.ex.beta", 300000), ("com.corvane.lockscreen", 180000)):
             clock.advance_ms(ms)
