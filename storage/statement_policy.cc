@@ -104,11 +104,12 @@ int AuthorizeAction(StatementScope scope, const char* table, int action, const c
   }
 }
 
+// Blanks as SQLite's tokenizer knows them: a vertical tab is no blank to it.
 bool IsOnlyBlanksAndComments(const char* tail) {
   if (tail == nullptr) return true;
   const char* p = tail;
   while (*p != '\0') {
-    if (*p == ' ' || *p == '\t' || *p == '\n' || *p == '\r' || *p == '\f' || *p == '\v') {
+    if (*p == ' ' || *p == '\t' || *p == '\n' || *p == '\r' || *p == '\f') {
       ++p;
     } else if (p[0] == '-' && p[1] == '-') {
       p = strchr(p, '\n');
