@@ -28,7 +28,9 @@ class MsClock:
     def _write(self):
         stamp = time.strftime("%Y-%m-%d %H:%M:%S", time.localtime(self.now_ms // 1000))
         with open(self.path + ".tmp", "w") as f:
-            f.write(f"{stamp}.{self.now_ms % 1000:03d}\n")
+            # Half a microsecond past the millisecond: libfaketime reads the fraction as a
+            # double and truncates, so ".015" alone would come back as 14.999999 ms.
+            f.write(f"{stamp}.{self.now_ms % 1000:03d}000500\n")
         os.replace(self.path + ".tmp", self.path)
 
     def advance_ms(self, ms):
