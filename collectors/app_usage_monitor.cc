@@ -106,9 +106,10 @@ int AppUsageMonitor::DeadHandler(int pid, void* data) {
   AppUsageMonitor* monitor = static_cast<AppUsageMonitor*>(data);
   if (monitor == nullptr) return -1;
   // Any tracked process, foreground or not, closes with the time since the period began.
-  if (g_periodStart >= 1 && g_clock() - g_periodStart >= kMinDeathPeriodMs &&
+  int64_t now = g_clock();
+  if (g_periodStart >= 1 && now - g_periodStart >= kMinDeathPeriodMs &&
       monitor->tracked.count(pid) != 0)
-    (void)monitor->Record(pid);
+    (void)monitor->Record(pid, now);
   monitor->tracked.erase(pid);
   return 0;
 }
@@ -140,8 +141,10 @@ void AppUsageMonitor::OnActiveWindow(int32_t pid, const char* name) {
   std::string packageId = PackageOfApp(appId);
   if (!IsExcluded(packageId)) Track(pid, packageId);
   if (currentPid != pid && currentPid != -2) {
-    if (tracked.count(currentPid) != 0) (void)Record(currentPid);
-    g_periodStart = tracked.count(pid) != 0 ? g_clock() : -1;
+    // One reading ends the old period and starts the new one, so no time falls between them.
+    int64_t now = g_clock();
+    if (tracked.count(currentPid) != 0) (void)Record(currentPid, now);
+    g_periodStart = tracked.count(pid) != 0 ? now : -1;
   }
   currentName = name;
   currentPid = pid;
@@ -149,7 +152,7 @@ void AppUsageMonitor::OnActiveWindow(int32_t pid, const char* name) {
 
 void AppUsageMonitor::OnScreenState(int on) {
   if (on == 0) {
-    if (tracked.count(currentPid) != 0) (void)Record(currentPid);
+    if (tracked.count(currentPid) != 0) (void)Record(currentPid, g_clock());
     currentPid = -2;
     return;
   }
@@ -161,13 +164,13 @@ void AppUsageMonitor::OnScreenState(int on) {
   (void)LaunchHandler(pid, this);
 }
 
-int AppUsageMonitor::Record(int32_t pid) {
+int AppUsageMonitor::Record(int32_t pid, int64_t now) {
   BaseLogProvider* provider = ProviderRegistry::GetInstance() != nullptr
                                   ? ProviderRegistry::GetInstance()->Lookup("use_app_survey")
                                   : nullptr;
   if (provider == nullptr) return -1;
   // A period of -1 (untracked foreground) lands far above the bound and is dropped here.
-  int64_t duration = g_clock() - g_periodStart;
+  int64_t duration = now - g_periodStart;
   if (duration < 1 || duration > kMaxPeriodMs) return -1;
   char buffer[512];
   const char* values =

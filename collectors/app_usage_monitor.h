@@ -33,7 +33,7 @@ class AppUsageMonitor {
 
  private:
   void Track(int32_t pid, const std::string& packageId);
-  int Record(int32_t pid);
+  int Record(int32_t pid, int64_t now);
 
   std::map<int32_t, std::string> tracked;
   std::string currentName;

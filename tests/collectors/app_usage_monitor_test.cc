@@ -9,6 +9,7 @@ namespace {
 
 int64_t g_now = 0;
 int64_t FakeNow() { return g_now; }
+int64_t TickingNow() { return g_now++; }  // time passes with every reading
 
 const int64_t kT0 = 1700000000000;  // any plausible epoch time
 
@@ -53,6 +54,14 @@ TEST_F(AppUsageMonitorTest, WritesOnePeriodPerForegroundChange) {
   ActivateAt(kT0 + 9400, getpid());  // a window of no application changes nothing
   ActivateAt(kT0 + 9600, beta);
   EXPECT_EQ(Periods(), "pkg.alpha:5000;pkg.beta:2000;pkg.alpha:600;");
+}
+
+TEST_F(AppUsageMonitorTest, APeriodStartsWhereTheLastOneEnded) {
+  AppUsageMonitor::SetClock(TickingNow);
+  ActivateAt(kT0, alpha);
+  ActivateAt(kT0 + 5000, beta);
+  ActivateAt(kT0 + 8000, alpha);
+  EXPECT_EQ(Periods(), "pkg.alpha:5000;pkg.beta:3000;");
 }
 
 TEST_F(AppUsageMonitorTest, StoresThePackageIdFromTheAppDatabaseVerbatim) {

@@ -105,6 +105,19 @@ def sanitizer_reports(log_dir):
     return [r for r in reports if r]
 
 
+def kill_programs_under(root):
+    """SIGKILLs every process whose program lives under |root| (apps a test launched and left)."""
+    prefix = root.rstrip("/") + "/"
+    for pid in os.listdir("/proc"):
+        if not pid.isdigit():
+            continue
+        try:
+            if os.readlink(f"/proc/{pid}/exe").startswith(prefix):
+                os.kill(int(pid), signal.SIGKILL)
+        except OSError:
+            pass  # gone already, or not ours to read
+
+
 class Device:
     """A simulated device: temp sysroot, private bus, optional Xvfb, the daemon process."""
 
@@ -279,6 +292,7 @@ class Device:
                 proc.send_signal(signal.SIGKILL)
             if proc is not None:
                 proc.wait()
+        kill_programs_under(self.sysroot)
         reports = valgrind_reports(self.sysroot) if VALGRIND else []
         races = sanitizer_reports(self.sysroot)
         subprocess.run([HOST_ENV, "stop", self.sysroot], capture_output=True)
