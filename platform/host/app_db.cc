@@ -129,6 +129,9 @@ class AppDb {
     }
     // The package tools may be writing at the same moment; wait briefly rather than fail.
     sqlite3_busy_timeout(db, 200);
+    // Repeated lookups are answered from memory, so the connection needs few pages of its own
+    // (a lookup reads the index and table paths: about four).
+    (void)sqlite3_exec(db, "PRAGMA cache_size = 16", nullptr, nullptr, nullptr);
     for (int i = 0; i < 2; ++i) {
       if (sqlite3_prepare_v3(db, kSql[i], -1, SQLITE_PREPARE_PERSISTENT, &stmts[i], nullptr) !=
           SQLITE_OK) {
