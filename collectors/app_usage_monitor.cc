@@ -3,11 +3,15 @@
 #include <Ecore.h>
 #include <Ecore_X.h>
 #include <aul.h>
+#include <errno.h>
 #include <pkgmgr-info.h>
+#include <poll.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/syscall.h>
 #include <sys/time.h>
+#include <unistd.h>
 
 #include "base_log_provider.h"
 #include "collectors/row_values.h"
@@ -22,6 +26,8 @@ const char* const kExcludedPackages[] = {"com.corvane.lockscreen", "com.corvane.
                                          "Homescreen", "com.corvane.homescreen"};
 
 const int64_t kMinDeathPeriodMs = 150;
+// Processes remembered before the ones that ended unannounced are let go.
+const size_t kKnownSweepAt = 64;
 const int64_t kMaxPeriodMs = 604799999;  // just under seven days
 
 int64_t SystemNowMs() {
@@ -53,6 +59,27 @@ std::string PackageOfApp(const char* appId) {
   return packageId;
 }
 
+// A handle on the process itself rather than on its number; -1 where the kernel has none, and
+// then the process is looked up at every activation.
+int OpenPidfd(int32_t pid) {
+#ifdef SYS_pidfd_open
+  return static_cast<int>(syscall(SYS_pidfd_open, static_cast<pid_t>(pid), 0));
+#else
+  (void)pid;
+  return -1;
+#endif
+}
+
+// A pidfd turns readable when its process ends; a poll that fails counts as ended.
+bool Ended(int pidfd) {
+  struct pollfd p = {pidfd, POLLIN, 0};
+  int rc;
+  do {
+    rc = poll(&p, 1, 0);
+  } while (rc < 0 && errno == EINTR);
+  return rc != 0;
+}
+
 // Starts watching the root window's properties once; an X connection is needed for it.
 int InstallPropertyHandler(void* monitor) {
   if (g_propertyEventHandler != nullptr) return 0;
@@ -73,6 +100,7 @@ AppUsageMonitor::~AppUsageMonitor() {
     (void)ecore_event_handler_del(g_propertyEventHandler);
     g_propertyEventHandler = nullptr;
   }
+  for (auto& entry : known) close(entry.second.pidfd);
 }
 
 void AppUsageMonitor::SetClock(Clock clock) { g_clock = clock != nullptr ? clock : SystemNowMs; }
@@ -85,19 +113,65 @@ int AppUsageMonitor::Start() {
   return 0;
 }
 
+// An application does not change under a running process, so a process already looked up is
+// answered from memory for as long as it runs (a process alive is the one its pidfd holds).
+bool AppUsageMonitor::PackageOfPid(int32_t pid, std::string* packageId) {
+  auto it = known.find(pid);
+  if (it != known.end()) {
+    if (!Ended(it->second.pidfd)) {
+      *packageId = it->second.packageId;
+      return true;
+    }
+    // Ended without its death announced: the pid may be another application's now, and what
+    // was tracked under it is the old process's.
+    Forget(pid);
+    tracked.erase(pid);
+  }
+  int pidfd = OpenPidfd(pid);
+  char appId[512];
+  memset(appId, 0, sizeof(appId));
+  bool found = aul_app_get_appid_bypid(pid, appId, sizeof(appId)) == AUL_R_OK;
+  if (found) *packageId = PackageOfApp(appId);
+  // Kept only for a process still running after the lookup, so the one the lookup saw, and
+  // only with a package: an empty one may be an app database that could not be read.
+  if (pidfd >= 0 && (!found || packageId->empty() || Ended(pidfd))) {
+    close(pidfd);
+    pidfd = -1;
+  }
+  if (pidfd >= 0) {
+    if (known.size() >= kKnownSweepAt) {
+      for (auto entry = known.begin(); entry != known.end();) {
+        if (Ended(entry->second.pidfd)) {
+          close(entry->second.pidfd);
+          entry = known.erase(entry);
+        } else {
+          ++entry;
+        }
+      }
+    }
+    known[pid] = KnownProcess{pidfd, *packageId};
+  }
+  return found;
+}
+
+void AppUsageMonitor::Forget(int32_t pid) {
+  auto it = known.find(pid);
+  if (it == known.end()) return;
+  close(it->second.pidfd);
+  known.erase(it);
+}
+
 void AppUsageMonitor::Track(int32_t pid, const std::string& packageId) {
   (void)tracked.emplace(pid, packageId);  // an entry already there is kept
 }
 
 int AppUsageMonitor::LaunchHandler(int pid, void* data) {
-  char appId[512];
-  memset(appId, 0, sizeof(appId));
-  if (aul_app_get_appid_bypid(pid, appId, sizeof(appId)) != AUL_R_OK) return -1;
-  if (InstallPropertyHandler(data) != 0) return -1;
-  std::string packageId = PackageOfApp(appId);
-  if (IsExcluded(packageId)) return 0;
   AppUsageMonitor* monitor = static_cast<AppUsageMonitor*>(data);
   if (monitor == nullptr) return -1;
+  std::string packageId;
+  if (!monitor->PackageOfPid(pid, &packageId)) return -1;
+  if (InstallPropertyHandler(data) != 0) return -1;
+  if (IsExcluded(packageId)) return 0;
   monitor->Track(pid, packageId);
   return 0;
 }
@@ -111,6 +185,7 @@ int AppUsageMonitor::DeadHandler(int pid, void* data) {
       monitor->tracked.count(pid) != 0)
     (void)monitor->Record(pid, now);
   monitor->tracked.erase(pid);
+  monitor->Forget(pid);
   return 0;
 }
 
@@ -134,11 +209,9 @@ unsigned char AppUsageMonitor::PropertyHandler(void* data, int, void* event) {
 }
 
 void AppUsageMonitor::OnActiveWindow(int32_t pid, const char* name) {
-  char appId[512];
-  memset(appId, 0, sizeof(appId));
+  std::string packageId;
   // A window of no application (a system popup) leaves the running period alone on purpose.
-  if (aul_app_get_appid_bypid(pid, appId, sizeof(appId)) != AUL_R_OK) return;
-  std::string packageId = PackageOfApp(appId);
+  if (!PackageOfPid(pid, &packageId)) return;
   if (!IsExcluded(packageId)) Track(pid, packageId);
   if (currentPid != pid && currentPid != -2) {
     // One reading ends the old period and starts the new one, so no time falls between them.

@@ -32,9 +32,20 @@ class AppUsageMonitor {
   static void SetClock(Clock clock);
 
  private:
+  // The package of |pid|'s application into |packageId|; false when it is no application.
+  bool PackageOfPid(int32_t pid, std::string* packageId);
+  void Forget(int32_t pid);
   void Track(int32_t pid, const std::string& packageId);
   int Record(int32_t pid, int64_t now);
 
+  // A process whose application was looked up, with a pidfd that says when that very process
+  // has ended, so a reused pid is never taken for it.
+  struct KnownProcess {
+    int pidfd;
+    std::string packageId;
+  };
+
+  std::map<int32_t, KnownProcess> known;
   std::map<int32_t, std::string> tracked;
   std::string currentName;
   int32_t currentPid;

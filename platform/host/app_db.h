@@ -19,6 +19,9 @@ enum class AppColumn { kAppId, kExec };
 // -1 when the database is missing or unreadable (a missing table counts as unreadable).
 int AppDbFind(AppColumn column, const char* value, std::vector<AppRecord>* out);
 
+// The first of those applications: 1 when there is one, 0 when none, -1 as above.
+int AppDbFindFirst(AppColumn column, const char* value, AppRecord* out);
+
 }  // namespace logmgr_host
 
 #endif  // LOGMGR_HOST_APP_DB_H_

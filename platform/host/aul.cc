@@ -13,7 +13,6 @@
 #include <unistd.h>
 
 #include <string>
-#include <vector>
 
 #include "app_db.h"
 #include "sender_trust.h"
@@ -107,8 +106,29 @@ int Listen(Listener* listener, int (*func)(int, void*), void* data) {
   return AUL_R_OK;
 }
 
-// The executable of |pid| as a device path: the sysroot prefix, if any, taken off.
-bool DevicePathOfExe(int pid, std::string* out) {
+// The sysroot prefix the kernel shows in /proc/<pid>/exe: the root resolved, without trailing
+// slashes, "" for none. Resolved once per value of LOGMGR_SYSROOT, not once per lookup.
+const std::string& ResolvedRoot() {
+  thread_local std::string value;
+  thread_local std::string prefix;
+  thread_local bool known = false;
+  const char* root = getenv("LOGMGR_SYSROOT");
+  if (root == nullptr) root = "";
+  if (known && value == root) return prefix;
+  value = root;
+  prefix.clear();
+  if (root[0] != '\0') {
+    char resolved[PATH_MAX];
+    prefix = realpath(root, resolved) != nullptr ? resolved : root;
+    while (prefix.size() > 1 && prefix.back() == '/') prefix.pop_back();
+    if (prefix == "/") prefix.clear();
+  }
+  known = true;
+  return prefix;
+}
+
+// The executable of |pid| as a device path in |out|: the sysroot prefix, if any, taken off.
+bool DevicePathOfExe(int pid, char* out, size_t size) {
   if (pid <= 0) return false;
   char link[64];
   (void)snprintf(link, sizeof(link), "/proc/%d/exe", pid);
@@ -116,30 +136,23 @@ bool DevicePathOfExe(int pid, std::string* out) {
   ssize_t n = readlink(link, exe, sizeof(exe) - 1);
   if (n <= 0) return false;
   exe[n] = '\0';
-  std::string path(exe);
-  const char* root = getenv("LOGMGR_SYSROOT");
-  if (root != nullptr && root[0] != '\0') {
-    // The kernel reports the resolved path, so compare with the resolved root.
-    char resolved[PATH_MAX];
-    std::string prefix = realpath(root, resolved) != nullptr ? resolved : root;
-    while (prefix.size() > 1 && prefix.back() == '/') prefix.pop_back();
-    if (prefix != "/" && path.size() > prefix.size() &&
-        path.compare(0, prefix.size(), prefix) == 0 && path[prefix.size()] == '/')
-      path.erase(0, prefix.size());
-  }
-  *out = path;
+  const std::string& prefix = ResolvedRoot();
+  size_t skip = 0;
+  if (!prefix.empty() && static_cast<size_t>(n) > prefix.size() &&
+      memcmp(exe, prefix.data(), prefix.size()) == 0 && exe[prefix.size()] == '/')
+    skip = prefix.size();
+  (void)snprintf(out, size, "%s", exe + skip);
   return true;
 }
 
 int AppOfPid(int pid, char* buf, int len, std::string logmgr_host::AppRecord::*field) {
   if (buf == nullptr || len <= 0) return AUL_R_EINVAL;
-  std::string exe;
-  if (!DevicePathOfExe(pid, &exe)) return AUL_R_ERROR;
-  std::vector<logmgr_host::AppRecord> apps;
-  if (logmgr_host::AppDbFind(logmgr_host::AppColumn::kExec, exe.c_str(), &apps) != 0 ||
-      apps.empty())
+  char exe[PATH_MAX];
+  if (!DevicePathOfExe(pid, exe, sizeof(exe))) return AUL_R_ERROR;
+  logmgr_host::AppRecord app;
+  if (logmgr_host::AppDbFindFirst(logmgr_host::AppColumn::kExec, exe, &app) != 1)
     return AUL_R_ERROR;
-  (void)snprintf(buf, static_cast<size_t>(len), "%s", (apps.front().*field).c_str());
+  (void)snprintf(buf, static_cast<size_t>(len), "%s", (app.*field).c_str());
   return AUL_R_OK;
 }
 

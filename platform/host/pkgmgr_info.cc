@@ -52,10 +52,9 @@ extern "C" {
 
 int pkgmgrinfo_appinfo_get_appinfo(const char* appid, pkgmgrinfo_appinfo_h* handle) {
   if (appid == nullptr || handle == nullptr) return PMINFO_R_EINVAL;
-  std::vector<AppRecord> apps;
-  if (logmgr_host::AppDbFind(AppColumn::kAppId, appid, &apps) != 0 || apps.empty())
-    return PMINFO_R_ERROR;
-  AppRecord* record = new (std::nothrow) AppRecord(std::move(apps.front()));
+  AppRecord app;
+  if (logmgr_host::AppDbFindFirst(AppColumn::kAppId, appid, &app) != 1) return PMINFO_R_ERROR;
+  AppRecord* record = new (std::nothrow) AppRecord(std::move(app));
   if (record == nullptr) return PMINFO_R_ERROR;
   *handle = record;
   return PMINFO_R_OK;

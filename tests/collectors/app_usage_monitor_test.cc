@@ -2,6 +2,12 @@
 // the clock in the test's hand. Window activations enter behind the X reads.
 #include "collectors/app_usage_monitor.h"
 
+#include <linux/sched.h>
+#include <string.h>
+#include <sys/syscall.h>
+
+#include <algorithm>
+
 #include "app_db_test_env.h"
 
 namespace _CorvaneLogManager {
@@ -39,6 +45,38 @@ class AppUsageMonitorTest : public AppDbTest {
     monitor->OnActiveWindow(pid, "window");
   }
   std::string Periods() { return Rows("SELECT app_id, duration FROM use_app_survey ORDER BY _id"); }
+
+  // Ends the child |pid| and collects it, so the number is free again.
+  void Reap(pid_t pid) {
+    kill(pid, SIGKILL);
+    waitpid(pid, nullptr, 0);
+    children.erase(std::remove(children.begin(), children.end(), pid), children.end());
+  }
+
+  // Runs the executable at device path |exec| as process |pid| (free, and ours to choose
+  // with CAP_SYS_ADMIN); returns the pid, or -1.
+  pid_t RunAt(pid_t pid, const std::string& exec) {
+    std::string file = sysroot + exec;
+    int fds[2];
+    if (pipe2(fds, O_CLOEXEC) != 0) return -1;
+    struct clone_args args;
+    memset(&args, 0, sizeof(args));
+    args.exit_signal = SIGCHLD;
+    args.set_tid = reinterpret_cast<uintptr_t>(&pid);
+    args.set_tid_size = 1;
+    long child = syscall(SYS_clone3, &args, sizeof(args));
+    if (child == 0) {
+      execl(file.c_str(), file.c_str(), "infinity", static_cast<char*>(nullptr));
+      _exit(127);
+    }
+    close(fds[1]);
+    char c;
+    if (child > 0) (void)read(fds[0], &c, 1);  // end of file: the exec closed the pipe
+    close(fds[0]);
+    if (child <= 0) return -1;
+    children.push_back(static_cast<pid_t>(child));
+    return static_cast<pid_t>(child);
+  }
 
   AppUsageMonitor* monitor = nullptr;
   pid_t alpha = -1, beta = -1, lock = -1;
@@ -85,8 +123,9 @@ TEST_F(AppUsageMonitorTest, ExcludedPackagesAreNeverTracked) {
     ASSERT_EQ(AppDb(std::string("UPDATE package_app_info SET package = '") + package +
                     "' WHERE app_id = 'com.corvane.lockscreen'"),
               SQLITE_OK);
+    pid_t excludedApp = Run("/opt/usr/apps/lock/bin/lock");  // a process keeps its first package
     ActivateAt(t, alpha);
-    ActivateAt(t + 1000, lock);
+    ActivateAt(t + 1000, excludedApp);
     ActivateAt(t + 3000, beta);  // nothing for the excluded window's 2 s
     t += 10000;
   }
@@ -136,23 +175,49 @@ TEST_F(AppUsageMonitorTest, DropsPeriodsOutsideTheBounds) {
 
 TEST_F(AppUsageMonitorTest, KeepsTheFirstPackageOfAProcessAndSkipsBadLookups) {
   ActivateAt(kT0, alpha);
-  // Reinstalled under another package while running: the tracked entry stays as it was.
+  // Reinstalled under another package while running: the process keeps the package it had.
   ASSERT_EQ(
       AppDb("UPDATE package_app_info SET package = 'pkg.renamed' WHERE app_id = 'com.ex.alpha'"),
       SQLITE_OK);
   ActivateAt(kT0 + 100, beta);
   ActivateAt(kT0 + 200, alpha);
   ActivateAt(kT0 + 300, beta);
-  // Unknown pid, then the app database missing, then corrupt: each activation is skipped.
+  // Unknown pid, then the app database missing, then corrupt: each activation of a process not
+  // looked up before is skipped; one already known is not looked up again.
+  pid_t fresh = Run("/opt/usr/apps/alpha/bin/alpha");
   ActivateAt(kT0 + 400, 0x3ffffff0);
   ASSERT_EQ(Sh("mv '" + sysroot + "/opt/dbspace/.pkgmgr_parser.db' '" + sysroot + "/saved.db'"), 0);
-  ActivateAt(kT0 + 500, alpha);
+  ActivateAt(kT0 + 500, fresh);
   ASSERT_EQ(Sh("echo garbage > '" + sysroot + "/opt/dbspace/.pkgmgr_parser.db'"), 0);
-  ActivateAt(kT0 + 600, alpha);
-  EXPECT_EQ(AppUsageMonitor::LaunchHandler(alpha, monitor), -1);
+  ActivateAt(kT0 + 600, fresh);
+  EXPECT_EQ(AppUsageMonitor::LaunchHandler(fresh, monitor), -1);
+  ActivateAt(kT0 + 650, alpha);
   ASSERT_EQ(Sh("mv '" + sysroot + "/saved.db' '" + sysroot + "/opt/dbspace/.pkgmgr_parser.db'"), 0);
-  ActivateAt(kT0 + 1000, alpha);
-  EXPECT_EQ(Periods(), "pkg.alpha:100;pkg.beta:100;pkg.alpha:100;pkg.beta:700;");
+  ActivateAt(kT0 + 1000, fresh);
+  ActivateAt(kT0 + 1500, beta);
+  EXPECT_EQ(Periods(),
+            "pkg.alpha:100;pkg.beta:100;pkg.alpha:100;pkg.beta:350;pkg.alpha:350;"
+            "pkg.renamed:500;");
+}
+
+// A pid that comes back as another app's process, after a death announced or one that was not,
+// is that other app's: nothing of the earlier process sticks to the number.
+TEST_F(AppUsageMonitorTest, APidReusedByAnotherAppIsTheNewApp) {
+  const pid_t pid = alpha;
+  ActivateAt(kT0, pid);
+  ActivateAt(kT0 + 1000, lock);
+  Reap(pid);
+  g_now = kT0 + 1500;
+  EXPECT_EQ(AppUsageMonitor::DeadHandler(pid, monitor), 0);
+  if (RunAt(pid, "/opt/usr/apps/beta/bin/beta") != pid)
+    GTEST_SKIP() << "cannot start a process under a chosen pid here (clone3 set_tid)";
+  ActivateAt(kT0 + 2000, pid);
+  ActivateAt(kT0 + 2500, lock);
+  Reap(pid);  // unannounced this time
+  ASSERT_EQ(RunAt(pid, "/opt/usr/apps/alpha/bin/alpha"), pid);
+  ActivateAt(kT0 + 3000, pid);
+  ActivateAt(kT0 + 3700, lock);
+  EXPECT_EQ(Periods(), "pkg.alpha:1000;pkg.beta:500;pkg.alpha:700;");
 }
 
 }  // namespace

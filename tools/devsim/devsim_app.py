@@ -36,6 +36,9 @@ def open_app_db():
         con = sqlite3.connect(path, timeout=5)
         con.execute("CREATE TABLE IF NOT EXISTS package_app_info(app_id TEXT PRIMARY KEY, "
                     "package TEXT NOT NULL, app_exec TEXT NOT NULL)")
+        # aul finds the app of every activated window by its executable.
+        con.execute("CREATE INDEX IF NOT EXISTS package_app_info_exec "
+                    "ON package_app_info(app_exec)")
     except sqlite3.DatabaseError as e:
         raise DevsimError(f"app database {path}: {e}")
     return con
