@@ -391,10 +391,18 @@ static size_t RenderIntegerCell(int64_t value, char* out) {
   *--first = ',';
   // Unsigned, so that the smallest integer has a magnitude too.
   uint64_t magnitude = value < 0 ? 0 - static_cast<uint64_t>(value) : static_cast<uint64_t>(value);
-  do {
-    *--first = static_cast<char>('0' + magnitude % 10);
-    magnitude /= 10;
-  } while (magnitude != 0);
+  // Two digits a step: a timestamp has thirteen.
+  static const char kPairs[] =
+      "00010203040506070809101112131415161718192021222324252627282930313233343536373839"
+      "40414243444546474849505152535455565758596061626364656667686970717273747576777879"
+      "8081828384858687888990919293949596979899";
+  while (magnitude >= 10) {
+    const char* pair = kPairs + 2 * (magnitude % 100);
+    magnitude /= 100;
+    *--first = pair[1];
+    *--first = pair[0];
+  }
+  if (magnitude != 0 || first == end - 1) *--first = static_cast<char>('0' + magnitude);
   if (value < 0) *--first = '-';
   size_t length = static_cast<size_t>(end - first);
   if (length > kNumberBuffer - 1) length = kNumberBuffer - 1;

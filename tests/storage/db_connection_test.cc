@@ -118,15 +118,43 @@ std::string FormattedRow(sqlite3_stmt* stmt) {
 }
 
 TEST_F(DbConnectionTest, RendersEveryCellAsTheFormattedRenderingDid) {
-  const char* values[] = {
-      "0", "-1", "9", "10", "-10", "99999999999999999", "999999999999999999",
-      "1000000000000000000", "-99999999999999999", "-999999999999999999",
-      "9223372036854775807", "-9223372036854775808", "0.0", "-1.5", "1e15", "-1e300", "1e-300",
-      "123456.7890125", "''", "','", "'a,b,'", "CAST(x'610062' AS TEXT)", "CAST(x'00' AS TEXT)",
-      "printf('%.297c', 'a')", "printf('%.298c', 'b')", "printf('%.299c', 'c')",
-      "printf('%.300c', 'd')", "printf('%.1000c', 'e')", "printf('%.297c', 'f') || 'éé'",
-      "x''", "x'00'", "x'6100'", "x'616263'", "zeroblob(3)", "CAST(printf('%.299c', 'g') AS BLOB)",
-      "CAST(printf('%.300c', 'h') AS BLOB)", "NULL"};
+  const char* values[] = {"0",
+                          "-1",
+                          "9",
+                          "10",
+                          "-10",
+                          "99999999999999999",
+                          "999999999999999999",
+                          "1000000000000000000",
+                          "-99999999999999999",
+                          "-999999999999999999",
+                          "9223372036854775807",
+                          "-9223372036854775808",
+                          "0.0",
+                          "-1.5",
+                          "1e15",
+                          "-1e300",
+                          "1e-300",
+                          "123456.7890125",
+                          "''",
+                          "','",
+                          "'a,b,'",
+                          "CAST(x'610062' AS TEXT)",
+                          "CAST(x'00' AS TEXT)",
+                          "printf('%.297c', 'a')",
+                          "printf('%.298c', 'b')",
+                          "printf('%.299c', 'c')",
+                          "printf('%.300c', 'd')",
+                          "printf('%.1000c', 'e')",
+                          "printf('%.297c', 'f') || 'éé'",
+                          "x''",
+                          "x'00'",
+                          "x'6100'",
+                          "x'616263'",
+                          "zeroblob(3)",
+                          "CAST(printf('%.299c', 'g') AS BLOB)",
+                          "CAST(printf('%.300c', 'h') AS BLOB)",
+                          "NULL"};
   Setup({"CREATE TABLE v(id INTEGER PRIMARY KEY, x);"});
   for (const char* value : values) {
     ASSERT_EQ(conn.Exec((std::string("INSERT INTO v(x) VALUES(") + value + ");").c_str()), 0);
