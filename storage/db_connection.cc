@@ -488,18 +488,21 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
   bool failed = false;
   // The array is sized by the whole table; a query yielding more rows than the table holds
   // is cut there rather than written past the array.
+  // Rows are stepped and read under the connection's mutex, a few rows per hold rather than a
+  // lock per call: the report worker shares the connection and gets it between holds.
+  const int kRowsPerHold = 32;
   sqlite3_mutex* mutex = sqlite3_db_mutex(db);
-  while (index < capacity) {
-    // Step and read under the connection's mutex, once per row rather than once per call: the
-    // report worker shares the connection, and sees it free between rows as before.
-    sqlite3_mutex_enter(mutex);
-    rc = sqlite3_step(stmt);
-    size_t length = 0;
-    if (rc == SQLITE_ROW) {
-      for (int c = 0; c < columns; ++c) length += RenderCell(stmt, c, scratch + length);
+  sqlite3_mutex_enter(mutex);
+  for (int held = 0; index < capacity; ++held) {
+    if (held == kRowsPerHold) {
+      sqlite3_mutex_leave(mutex);
+      sqlite3_mutex_enter(mutex);
+      held = 0;
     }
-    sqlite3_mutex_leave(mutex);
+    rc = sqlite3_step(stmt);
     if (rc != SQLITE_ROW) break;
+    size_t length = 0;
+    for (int c = 0; c < columns; ++c) length += RenderCell(stmt, c, scratch + length);
     used += length + 1;
     if (used > limit) {
       resultTooLarge = true;
@@ -516,6 +519,7 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
     row[length] = '\0';
     out[index++] = row;
   }
+  sqlite3_mutex_leave(mutex);
   delete[] scratch;
   if (rc == SQLITE_INTERRUPT) {
     FreeRows(out, index);
