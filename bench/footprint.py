@@ -1,11 +1,16 @@
 #!/usr/bin/python3
 """Footprint of logmgrd on the simulated device (with Xvfb): idle RSS, wakeups while idle, and
-CPU time per 10,000 Inserts over the bus against 10,000 bare SQLite inserts of the same row.
+the daemon's CPU time per 10,000 Inserts over the bus against its floor: the daemon's CPU for
+as many Peer.Ping round trips (a call its connection answers with no handler) plus the CPU of
+as many bare prepared SQLite inserts of the same row (WAL, synchronous NORMAL, autocommit).
 
   bench/footprint.py [IDLE_SECONDS] [INSERTS]    (defaults 60 and 10000; scripts/build first)
 
 Wakeups are the growth of each thread's run count (/proc/<pid>/task/*/schedstat, third field);
-CPU is utime + stime of the daemon from /proc/<pid>/stat.
+the daemon's CPU is the sum of its threads' run time (first field, in ns). The three kinds of
+work run in chunks, taking turns, so that machine load falls on all of them alike; the bare
+inserts run in this process (sqlite3's executemany, one statement prepared once) and count this
+thread's CPU.
 """
 import glob
 import importlib.machinery
@@ -14,6 +19,8 @@ import sqlite3
 import sys
 import tempfile
 import time
+
+import dbus
 
 HERE = os.path.dirname(os.path.abspath(__file__))
 sys.path.insert(0, os.path.join(HERE, "..", "tests", "system"))
@@ -40,27 +47,43 @@ def thread_runs(pid):
 
 
 def cpu_seconds(pid):
-    with open(f"/proc/{pid}/stat") as f:
-        fields = f.read().rsplit(")", 1)[1].split()
-    return (int(fields[11]) + int(fields[12])) / TICK
+    """Run time of the daemon's live threads, in seconds."""
+    total = 0
+    for path in glob.glob(f"/proc/{pid}/task/*/schedstat"):
+        try:
+            with open(path) as f:
+                total += int(f.read().split()[0])
+        except (OSError, IndexError):
+            pass  # a thread that ended meanwhile
+    return total / 1e9
 
 
-def bare_inserts(count):
-    """CPU seconds of |count| autocommitted inserts of the provider's row, WAL + NORMAL."""
-    with tempfile.TemporaryDirectory() as d:
-        con = sqlite3.connect(os.path.join(d, "bare.db"), isolation_level=None)
-        con.execute("PRAGMA journal_mode=WAL")
-        con.execute("PRAGMA synchronous=NORMAL")
-        con.execute("CREATE TABLE t(_id INTEGER PRIMARY KEY AUTOINCREMENT, timestamp INTEGER, "
-                    "time_zone TEXT, app_id TEXT, feature TEXT, extra TEXT, value INTEGER)")
-        start = time.process_time()
-        for i in range(count):
-            con.execute("INSERT INTO t(timestamp,time_zone,app_id,feature,value) "
-                        "VALUES(?,?,?,?,?)", (int(time.time() * 1000), "Etc/UTC", "bench",
-                                              "F", i))
-        used = time.process_time() - start
-        con.close()
+class BareInserts:
+    """Autocommitted inserts of the provider's row into a table of the same shape, WAL + NORMAL,
+    through one statement prepared once."""
+
+    def __init__(self, directory):
+        self.con = sqlite3.connect(os.path.join(directory, "bare.db"), isolation_level=None)
+        self.con.execute("PRAGMA journal_mode=WAL")
+        self.con.execute("PRAGMA synchronous=NORMAL")
+        self.con.execute("CREATE TABLE t(_id INTEGER PRIMARY KEY AUTOINCREMENT, timestamp "
+                         "INTEGER, time_zone TEXT, app_id TEXT, feature TEXT, extra TEXT, "
+                         "value INTEGER)")
+        self.done = 0
+
+    def run(self, count):
+        """This thread's CPU seconds for |count| inserts."""
+        now = int(time.time() * 1000)
+        rows = [(now, "Etc/UTC", "bench", "F", str(self.done + i)) for i in range(count)]
+        start = time.thread_time()
+        self.con.executemany("INSERT INTO t(timestamp,time_zone,app_id,feature,value) "
+                             "VALUES(?,?,?,?,?)", rows)
+        used = time.thread_time() - start
+        self.done += count
         return used
+
+    def close(self):
+        self.con.close()
 
 
 def main():
@@ -87,18 +110,52 @@ def main():
               + "".join(f"\n  thread {t}: {n}" for t, n in sorted(woke.items())))
 
         proxy = table_proxy(dev, FEATURE)
-        cpu0 = cpu_seconds(proc.pid)
-        wall0 = time.monotonic()
-        for i in range(inserts):
-            proxy.Insert({"app_id": "bench", "feature": "F", "value": str(i)})
-        wall = time.monotonic() - wall0
-        daemon_cpu = cpu_seconds(proc.pid) - cpu0
-        bare = bare_inserts(inserts)
+        bus = dbus.bus.BusConnection(dev.env["DBUS_SYSTEM_BUS_ADDRESS"])
+        chunk = 500
+        rounds = max(1, inserts // chunk)
+        used = {"insert": 0.0, "ping": 0.0, "bare": 0.0}
+        done = {"insert": 0, "ping": 0}
+
+        def bus_chunk(kind):
+            cpu0 = cpu_seconds(proc.pid)
+            for _ in range(chunk):
+                if kind == "insert":
+                    proxy.Insert({"app_id": "bench", "feature": "F", "value": str(done[kind])})
+                else:
+                    bus.call_blocking("com.corvane.logmgr", "/", "org.freedesktop.DBus.Peer",
+                                      "Ping", "", ())
+                done[kind] += 1
+            used[kind] += cpu_seconds(proc.pid) - cpu0
+
+        with tempfile.TemporaryDirectory() as d:
+            bare = BareInserts(d)
+
+            def bare_chunk():
+                used["bare"] += bare.run(chunk)
+
+            steps = [lambda: bus_chunk("insert"), lambda: bus_chunk("ping"), bare_chunk]
+            bus_chunk("insert")  # warm-up, not counted
+            bus_chunk("ping")
+            for kind in used:
+                used[kind] = 0.0
+            wall0 = time.monotonic()
+            for r in range(rounds):
+                for k in range(3):
+                    steps[(r + k) % 3]()
+            wall = time.monotonic() - wall0
+            bare.close()
+        calls = rounds * chunk
+        floor = used["ping"] + used["bare"]
+        per = 10000 / calls
+        print(f"{calls} calls of each kind, in chunks of {chunk} taking turns ({wall:.1f} s); "
+              f"CPU per 10,000:")
+        print(f"  daemon, bus Inserts:                 {used['insert'] * per * 1000:8.0f} ms "
+              f"({used['insert'] * 1e6 / calls:.1f} us each)")
+        print(f"  daemon, Peer.Ping round trips:       {used['ping'] * per * 1000:8.0f} ms")
+        print(f"  bare prepared SQLite inserts:        {used['bare'] * per * 1000:8.0f} ms")
+        print(f"  floor (Ping + bare insert):          {floor * per * 1000:8.0f} ms")
+        print(f"  ratio bus Insert / floor:            {used['insert'] / floor:8.2f}")
         rss_after = int(footprint.status(proc.pid, "VmRSS"))
-        print(f"{inserts} bus inserts: daemon CPU {daemon_cpu * 1000:.0f} ms "
-              f"({daemon_cpu * 1e6 / inserts:.1f} us each), wall {wall:.1f} s; "
-              f"bare SQLite inserts of the same row: {bare * 1000:.0f} ms CPU; "
-              f"ratio {daemon_cpu / bare:.1f}x")
         print(f"RSS after the inserts: {rss_after / 1024:.1f} MB")
     finally:
         dev.close()

@@ -55,12 +55,11 @@ bool IsCallerRowId(const char* value) {
   return id >= 1;
 }
 
-// Copies |length| bytes to |dst| through a pipe, so that the kernel, not this process, touches
-// the caller's pages: a page that cannot be had (a hugetlb segment without reserve) is then an
-// EFAULT here instead of a SIGBUS that would end the daemon.
-bool CopyThroughKernel(char* dst, const char* src, size_t length) {
-  int fds[2];
-  if (pipe2(fds, O_CLOEXEC | O_NONBLOCK) != 0) return false;
+// Copies |length| bytes to |dst| through the empty pipe |fds|, so that the kernel, not this
+// process, touches the caller's pages: a page that cannot be had (a hugetlb segment without
+// reserve) is then an EFAULT here instead of a SIGBUS that would end the daemon. The pipe is
+// empty again on success.
+bool CopyThroughKernel(const int fds[2], char* dst, const char* src, size_t length) {
   bool ok = true;
   size_t done = 0;
   while (ok && done < length) {
@@ -81,8 +80,6 @@ bool CopyThroughKernel(char* dst, const char* src, size_t length) {
     }
     done += static_cast<size_t>(in);
   }
-  (void)close(fds[0]);
-  (void)close(fds[1]);
   return ok;
 }
 
@@ -182,8 +179,11 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
   if (base == reinterpret_cast<void*>(-1)) return -1;
   size_t bytes = SegmentBytes(rows, rowCount);
   bool ok = bytes <= SegmentRoom(shmId, callerUid);
-  // Staged in chunks so that each reaches the segment in one copy.
-  char chunk[16384];
+  // One pipe for the whole result; chunks of a default pipe's capacity (a smaller pipe takes
+  // them in parts).
+  int fds[2] = {-1, -1};
+  if (ok && pipe2(fds, O_CLOEXEC | O_NONBLOCK) != 0) ok = false;
+  char chunk[65536];
   size_t staged = 0;
   size_t written = 0;
   auto stage = [&](const char* data, size_t length) {
@@ -194,7 +194,7 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
       data += take;
       length -= take;
       if (staged == sizeof(chunk)) {
-        ok = CopyThroughKernel(static_cast<char*>(base) + written, chunk, staged);
+        ok = CopyThroughKernel(fds, static_cast<char*>(base) + written, chunk, staged);
         written += staged;
         staged = 0;
       }
@@ -202,7 +202,12 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
   };
   for (int i = 0; ok && i < rowCount; ++i) stage(rows[i], strlen(rows[i]) + 1);
   stage("&", 1);
-  if (ok && staged > 0) ok = CopyThroughKernel(static_cast<char*>(base) + written, chunk, staged);
+  if (ok && staged > 0)
+    ok = CopyThroughKernel(fds, static_cast<char*>(base) + written, chunk, staged);
+  if (fds[0] >= 0) {
+    (void)close(fds[0]);
+    (void)close(fds[1]);
+  }
   (void)shmdt(base);
   return ok ? 0 : -1;
 }

@@ -16,6 +16,7 @@
 #include "db_connection.h"
 #include "provider_registry.h"
 #include "providers/provider_bus_guard.h"
+#include "providers/sender_uid_cache.h"
 #include "storage/db_manager.h"
 
 namespace {
@@ -110,13 +111,14 @@ DBusHandlerResult RememberCaller(DBusConnection*, DBusMessage* message, void*) {
   return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
 }
 
-// The calling user, as the bus daemon knows the sender. false when it cannot tell.
-bool CallerUid(uid_t* uid) {
-  if (gBus == nullptr || gCallerName[0] == '\0') return false;
+// Enough for every regular caller at once; a flood of one-shot callers only costs lookups.
+constexpr size_t kKnownCallers = 64;
+
+bool BusUidOf(void* connection, const char* uniqueName, uid_t* uid) {
   DBusError error;
   dbus_error_init(&error);
   unsigned long user =
-      dbus_bus_get_unix_user(dbus_g_connection_get_connection(gBus), gCallerName, &error);
+      dbus_bus_get_unix_user(static_cast<DBusConnection*>(connection), uniqueName, &error);
   if (dbus_error_is_set(&error)) {
     dbus_error_free(&error);
     return false;
@@ -124,6 +126,14 @@ bool CallerUid(uid_t* uid) {
   if (user == static_cast<unsigned long>(-1)) return false;
   *uid = static_cast<uid_t>(user);
   return true;
+}
+
+// The calling user, as the bus daemon knows the sender; asked once per unique name, which the
+// bus never hands to another connection. false when it cannot tell.
+bool CallerUid(uid_t* uid) {
+  static SenderUidCache* known = new SenderUidCache(kKnownCallers);  // for the process's life
+  if (gBus == nullptr || gCallerName[0] == '\0') return false;
+  return known->UidOf(gCallerName, BusUidOf, dbus_g_connection_get_connection(gBus), uid);
 }
 
 void Constructed(GObject* object) {

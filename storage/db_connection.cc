@@ -378,6 +378,78 @@ int64_t DbConnection::ScalarQuery(const char* sql) {
   return value;
 }
 
+// Cell rendering for Select. Each writes one column as a row text carries it at |out| (room for
+// kTextBuffer bytes) and returns the length, with the cuts snprintf into a buffer of the cell's
+// size made: numbers are cut at kNumberBuffer, texts and blobs at kTextBuffer (a longer one loses
+// its tail and its comma), NULL renders as nothing. No terminator is written.
+
+// The decimal digits and comma of |value|.
+static size_t RenderIntegerCell(int64_t value, char* out) {
+  char digits[24];
+  char* end = digits + sizeof(digits);
+  char* first = end;
+  *--first = ',';
+  // Unsigned, so that the smallest integer has a magnitude too.
+  uint64_t magnitude = value < 0 ? 0 - static_cast<uint64_t>(value) : static_cast<uint64_t>(value);
+  // Two digits a step: a timestamp has thirteen.
+  static const char kPairs[] =
+      "00010203040506070809101112131415161718192021222324252627282930313233343536373839"
+      "40414243444546474849505152535455565758596061626364656667686970717273747576777879"
+      "8081828384858687888990919293949596979899";
+  while (magnitude >= 10) {
+    const char* pair = kPairs + 2 * (magnitude % 100);
+    magnitude /= 100;
+    *--first = pair[1];
+    *--first = pair[0];
+  }
+  if (magnitude != 0 || first == end - 1) *--first = static_cast<char>('0' + magnitude);
+  if (value < 0) *--first = '-';
+  size_t length = static_cast<size_t>(end - first);
+  if (length > kNumberBuffer - 1) length = kNumberBuffer - 1;
+  memcpy(out, first, length);
+  return length;
+}
+
+// The bytes of |text| up to its first NUL or its |bytes|, whichever comes first, and a comma.
+static size_t RenderTextCell(const char* text, size_t bytes, char* out) {
+  const size_t room = kTextBuffer - 1;
+  size_t length = bytes < room ? bytes : room;
+  const void* nul = memchr(text, '\0', length);
+  if (nul != nullptr) length = static_cast<size_t>(static_cast<const char*>(nul) - text);
+  memcpy(out, text, length);
+  if (length < room) out[length++] = ',';
+  return length;
+}
+
+// One column of the current row of |stmt|. The caller holds the connection's mutex, so the value
+// sqlite3_column_value hands out may be read directly, as sqlite3_column_text does inside: one
+// lock per cell instead of one per call.
+static size_t RenderCell(sqlite3_stmt* stmt, int col, char* out) {
+  sqlite3_value* value = sqlite3_column_value(stmt, col);
+  switch (sqlite3_value_type(value)) {
+    case SQLITE_INTEGER:
+      return RenderIntegerCell(sqlite3_value_int64(value), out);
+    case SQLITE_FLOAT:
+      // Rare in the daemon's tables, and %f's rounding is glibc's: left to snprintf.
+      return RenderColumn(stmt, col, out);
+    case SQLITE_TEXT: {
+      const unsigned char* text = sqlite3_value_text(value);
+      if (text == nullptr) return 0;
+      return RenderTextCell(reinterpret_cast<const char*>(text),
+                            static_cast<size_t>(sqlite3_value_bytes(value)), out);
+    }
+    case SQLITE_BLOB: {
+      const void* blob = sqlite3_value_blob(value);
+      // An empty blob has no pointer and renders as its comma alone.
+      if (blob == nullptr) return RenderTextCell("", 0, out);
+      return RenderTextCell(static_cast<const char*>(blob),
+                            static_cast<size_t>(sqlite3_value_bytes(value)), out);
+    }
+    default:
+      return 0;
+  }
+}
+
 int DbConnection::Select(const char* sql, const char* table, int* rowCount, char*** rows) {
   if (sql == nullptr || db == nullptr || rowCount == nullptr || rows == nullptr) return -1;
   int capacity = Count(table);
@@ -416,9 +488,21 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
   bool failed = false;
   // The array is sized by the whole table; a query yielding more rows than the table holds
   // is cut there rather than written past the array.
-  while (index < capacity && (rc = sqlite3_step(stmt)) == SQLITE_ROW) {
+  // Rows are stepped and read under the connection's mutex, a few rows per hold rather than a
+  // lock per call: the report worker shares the connection and gets it between holds.
+  const int kRowsPerHold = 32;
+  sqlite3_mutex* mutex = sqlite3_db_mutex(db);
+  sqlite3_mutex_enter(mutex);
+  for (int held = 0; index < capacity; ++held) {
+    if (held == kRowsPerHold) {
+      sqlite3_mutex_leave(mutex);
+      sqlite3_mutex_enter(mutex);
+      held = 0;
+    }
+    rc = sqlite3_step(stmt);
+    if (rc != SQLITE_ROW) break;
     size_t length = 0;
-    for (int c = 0; c < columns; ++c) length += RenderColumn(stmt, c, scratch + length);
+    for (int c = 0; c < columns; ++c) length += RenderCell(stmt, c, scratch + length);
     used += length + 1;
     if (used > limit) {
       resultTooLarge = true;
@@ -426,14 +510,16 @@ int DbConnection::Select(const char* sql, const char* table, int* rowCount, char
       break;
     }
     // A row whose columns are all NULL becomes an empty text, so every counted slot is valid.
-    char* row = new (std::nothrow) char[length + 1]();
+    char* row = new (std::nothrow) char[length + 1];
     if (row == nullptr) {
       failed = true;
       break;
     }
     memcpy(row, scratch, length);
+    row[length] = '\0';
     out[index++] = row;
   }
+  sqlite3_mutex_leave(mutex);
   delete[] scratch;
   if (rc == SQLITE_INTERRUPT) {
     FreeRows(out, index);

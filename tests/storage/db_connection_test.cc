@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 #include <pthread.h>
 #include <sqlite3.h>
+#include <stdio.h>
 #include <stdlib.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -86,6 +87,106 @@ TEST_F(DbConnectionTest, RendersColumnsAsCommaTerminatedTexts) {
   for (size_t i = 0; i < rows.size(); ++i) {
     SCOPED_TRACE(cases[i].name);
     EXPECT_EQ(rows[i], cases[i].want);
+  }
+}
+
+// The cells as the formatted rendering made them, cell by cell into buffers of the cell's size.
+std::string FormattedRow(sqlite3_stmt* stmt) {
+  std::string row;
+  for (int c = 0; c < sqlite3_column_count(stmt); ++c) {
+    char cell[300] = "";
+    switch (sqlite3_column_type(stmt, c)) {
+      case SQLITE_INTEGER:
+        snprintf(cell, 20, "%lld,", static_cast<long long>(sqlite3_column_int64(stmt, c)));
+        break;
+      case SQLITE_FLOAT:
+        snprintf(cell, 20, "%f,", sqlite3_column_double(stmt, c));
+        break;
+      case SQLITE_TEXT:
+        snprintf(cell, sizeof(cell), "%s,", sqlite3_column_text(stmt, c));
+        break;
+      case SQLITE_BLOB: {
+        const void* blob = sqlite3_column_blob(stmt, c);
+        snprintf(cell, sizeof(cell), "%.*s,", blob ? sqlite3_column_bytes(stmt, c) : 0,
+                 blob ? static_cast<const char*>(blob) : "");
+        break;
+      }
+    }
+    row += cell;
+  }
+  return row;
+}
+
+TEST_F(DbConnectionTest, RendersEveryCellAsTheFormattedRenderingDid) {
+  const char* values[] = {"0",
+                          "-1",
+                          "9",
+                          "10",
+                          "-10",
+                          "99999999999999999",
+                          "999999999999999999",
+                          "1000000000000000000",
+                          "-99999999999999999",
+                          "-999999999999999999",
+                          "9223372036854775807",
+                          "-9223372036854775808",
+                          "0.0",
+                          "-1.5",
+                          "1e15",
+                          "-1e300",
+                          "1e-300",
+                          "123456.7890125",
+                          "''",
+                          "','",
+                          "'a,b,'",
+                          "CAST(x'610062' AS TEXT)",
+                          "CAST(x'00' AS TEXT)",
+                          "printf('%.297c', 'a')",
+                          "printf('%.298c', 'b')",
+                          "printf('%.299c', 'c')",
+                          "printf('%.300c', 'd')",
+                          "printf('%.1000c', 'e')",
+                          "printf('%.297c', 'f') || 'éé'",
+                          "x''",
+                          "x'00'",
+                          "x'6100'",
+                          "x'616263'",
+                          "zeroblob(3)",
+                          "CAST(printf('%.299c', 'g') AS BLOB)",
+                          "CAST(printf('%.300c', 'h') AS BLOB)",
+                          "NULL"};
+  Setup({"CREATE TABLE v(id INTEGER PRIMARY KEY, x);"});
+  for (const char* value : values) {
+    ASSERT_EQ(conn.Exec((std::string("INSERT INTO v(x) VALUES(") + value + ");").c_str()), 0);
+  }
+  // A row holding each value next to its neighbours; then the widest row a bus request may ask,
+  // with every cell at or past its cut.
+  std::string wide = "x";
+  for (int i = 1; i < DbConnection::kBusMaxColumns; ++i) wide += i % 2 ? ", -x" : ", x";
+  for (std::string columns : {std::string("x, x || '', id, x"), wide}) {
+    SCOPED_TRACE(columns);
+    std::string sql = "SELECT " + columns + " FROM v ORDER BY id;";
+    Rows want;
+    size_t bytes = 1;
+    sqlite3_stmt* stmt = nullptr;
+    ASSERT_EQ(sqlite3_prepare_v2(conn.Handle(), sql.c_str(), -1, &stmt, nullptr), SQLITE_OK);
+    while (sqlite3_step(stmt) == SQLITE_ROW) {
+      want.push_back(FormattedRow(stmt));
+      bytes += want.back().size() + 1;
+    }
+    sqlite3_finalize(stmt);
+    ASSERT_EQ(want.size(), sizeof(values) / sizeof(values[0]));
+    Rows got = Select(sql.c_str(), "v");
+    ASSERT_EQ(got.size(), want.size());
+    for (size_t i = 0; i < got.size(); ++i) EXPECT_EQ(got[i], want[i]) << values[i];
+    // A bus request's limit falls on the rendered bytes exactly.
+    for (size_t limit : {bytes, bytes - 1}) {
+      DbConnection::BusRequestScope request(&conn, "v");
+      request.LimitResult(limit);
+      int rc = 1;
+      EXPECT_EQ(Select(sql.c_str(), "v", &rc).size(), limit == bytes ? want.size() : 0u);
+      EXPECT_EQ(request.ResultTooLarge(), limit != bytes);
+    }
   }
 }
 
