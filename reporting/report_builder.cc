@@ -7,11 +7,13 @@
 #include <sys/time.h>
 
 #include "base_log_provider.h"
+#include "db_connection.h"
 #include "log_manager.h"
 #include "provider_registry.h"
 #include "reporting/local_midnight.h"
 #include "reporting/row_splitter.h"
 #include "sql_literal.h"
+#include "storage/db_manager.h"
 #include "storage/pref_store.h"
 
 namespace _CorvaneLogManager {
@@ -133,9 +135,23 @@ const char* ReportBuilder::AppVersion() const {
   return identity.Firmware() != nullptr ? identity.Firmware() : kDefaultVersion;
 }
 
+namespace {
+
+DbConnection* QueueConnection() {
+  UploadDbManager* manager = UploadDbManager::GetInstance();
+  return manager != nullptr ? manager->GetConnection() : nullptr;
+}
+
+}  // namespace
+
 int ReportBuilder::RunDaily() {
   if (!GetRuntimeSwitch(1)) return -1;
+  // A worker stopped inside a table's transaction leaves it open; its records were never
+  // committed and that table's rows are still there, so dropping them loses nothing.
+  DbConnection* queueConn = QueueConnection();
+  if (queueConn != nullptr && queueConn->RollBackOpenTransaction() != 0) return -1;
   (void)identity.Refresh();
+  headReady = false;  // the identity may have changed
   PrefStore* prefs = Prefs();
   if (prefs == nullptr) return -1;
   time_t now = static_cast<time_t>((clockFn != nullptr ? clockFn() : SystemClockMs()) / 1000);
@@ -188,6 +204,20 @@ void ReportBuilder::ComputeWindow(time_t day, int mode, int offsetHours, int len
 }
 
 int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
+  // The table's records go into the queue in one transaction, committed before its rows are
+  // purged: a kill or a failure before the commit leaves neither records nor a purge.
+  // Without a queue a record fails at its insert, as it always did.
+  DbConnection* queueConn = QueueConnection();
+  if (queueConn != nullptr && queueConn->BeginTransaction() != 0) return -1;
+  if (AggregateWindows(agg, day) != 0) {
+    if (queueConn != nullptr) (void)queueConn->RollBackOpenTransaction();
+    return -1;
+  }
+  if (queueConn != nullptr && queueConn->CommitTransaction() != 0) return -1;
+  return PurgeTable(agg.table, windowEnd);
+}
+
+int ReportBuilder::AggregateWindows(const Aggregation& agg, time_t day) {
   bool slice = g_sliceMode && agg.sliceWindows > 0;
   char columns[320];
   snprintf(columns, sizeof(columns), "%s%s", agg.columns,
@@ -222,7 +252,7 @@ int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
     FreeRows(rows, rowCount);
     if (result != 0) return -1;
   }
-  return PurgeTable(agg.table, windowEnd);
+  return 0;
 }
 
 int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumText,
@@ -257,13 +287,26 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
   return WriteRecord(agg.activity, body);
 }
 
-size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) const {
+void ReportBuilder::PrepareHead() {
+  if (headReady) return;
+  char head[kBodySize];
   size_t len = 0;
-  body[0] = '\0';
-  AppendF(body, size, &len, "mcc=%s%smnc=%s%sdid=%smodel=%s%sfw_ver=%s%sdate=%s%s",
+  head[0] = '\0';
+  AppendF(head, sizeof(head), &len, "mcc=%s%smnc=%s%sdid=%smodel=%s%sfw_ver=%s%sdate=",
           DeviceText(identity.Mcc()).c_str(), kSeparator, DeviceText(identity.Mnc()).c_str(),
           kSeparator, kSeparator, DeviceText(identity.Model()).c_str(), kSeparator,
-          DeviceText(AppVersion()).c_str(), kSeparator, date, kSeparator);
+          DeviceText(AppVersion()).c_str(), kSeparator);
+  bodyHead = head;
+  recordVersion = DeviceText(AppVersion());
+  headReady = true;
+}
+
+size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) {
+  PrepareHead();
+  size_t len = 0;
+  body[0] = '\0';
+  // One format of the whole text, so a cut falls where it always did.
+  AppendF(body, size, &len, "%s%s%s", bodyHead.c_str(), date, kSeparator);
   return len;
 }
 
@@ -279,7 +322,8 @@ int ReportBuilder::WriteSummary(const char* renderedDay) {
 int ReportBuilder::WriteRecord(const char* activity, const char* body) {
   char values[kValuesSize];
   snprintf(values, sizeof(values), "'701','999','%s','BIZ','", activity);
-  (void)AppendQuoted(values, sizeof(values), DeviceText(AppVersion()).c_str());
+  PrepareHead();
+  (void)AppendQuoted(values, sizeof(values), recordVersion.c_str());
   size_t used = strlen(values);
   snprintf(values + used, sizeof(values) - used, "','");
   // The body is stored whole when the statement holds it, else up to the last whole UTF-8
