@@ -35,6 +35,22 @@ DbConnection* SurveyConnection() {
   return manager == nullptr ? nullptr : manager->GetConnection();
 }
 
+// values += "," + the decimal text of |n|, as "%lld" writes it (once per insert, so no printf).
+void AppendCommaAndNumber(std::string* values, long long n) {
+  char text[24];
+  char* end = text + sizeof(text);
+  char* p = end;
+  unsigned long long magnitude =
+      n < 0 ? 0ULL - static_cast<unsigned long long>(n) : static_cast<unsigned long long>(n);
+  do {
+    *--p = static_cast<char>('0' + magnitude % 10);
+    magnitude /= 10;
+  } while (magnitude != 0);
+  if (n < 0) *--p = '-';
+  *--p = ',';
+  values->append(p, static_cast<size_t>(end - p));
+}
+
 bool IsSqlBlank(char c) { return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f'; }
 
 bool EndsToken(char c) { return c == '\0' || c == ',' || IsSqlBlank(c); }
@@ -144,11 +160,10 @@ int BaseLogProvider::ValidateColumns(const char* columnList) {
 
 void BaseLogProvider::AppendAutoColumns(std::string* columns, std::string* values) {
   for (const std::string& column : config.columns) {
+    if (column[0] != 't') continue;  // neither automatic column
     if (column == "timestamp") {
-      char now[32];
-      snprintf(now, sizeof(now), ",%lld", NowMs());
       columns->append(",timestamp");
-      values->append(now);
+      AppendCommaAndNumber(values, NowMs());
     } else if (column == "time_zone") {
       char pathBuf[4096];
       const char* link = logmgr_fixed_path("/opt/etc/localtime", pathBuf, sizeof(pathBuf));
@@ -208,8 +223,13 @@ int BaseLogProvider::InsertRow(const char* columns, const char* values, int32_t*
 int BaseLogProvider::InsertOn(DbConnection* conn, const char* columns, const char* values,
                               int32_t* rowId, bool countRows) {
   if (conn == nullptr || columns == nullptr || values == nullptr) return -1;
-  std::string columnText(columns);
-  std::string valueText(values);
+  std::string columnText;
+  std::string valueText;
+  // Room for the automatic columns up front: appending them then copies nothing.
+  columnText.reserve(strlen(columns) + 32);
+  valueText.reserve(strlen(values) + 80);
+  columnText.append(columns);
+  valueText.append(values);
   if (columnText.empty() || valueText.empty()) return -1;
   if (ValidateColumns(columnText.c_str()) != 0) return -1;
   AppendAutoColumns(&columnText, &valueText);
@@ -238,21 +258,25 @@ int BaseLogProvider::InsertKept(DbConnection* conn, const char* columns, const c
   char decoded[kStatementSize];
   int count = ParsePlainLiterals(values, bound, kListSize, decoded, sizeof(decoded));
   if (count <= 0) return DbConnection::kNotRun;
-  int columnCount = 1;
-  for (const char* c = columns; *c != '\0'; ++c) columnCount += *c == ',' ? 1 : 0;
-  // Miscounted lists fail on the text path, with its own answer.
-  if (columnCount != count) return DbConnection::kNotRun;
-  char sql[kStatementSize];
-  size_t used = static_cast<size_t>(
-      snprintf(sql, sizeof(sql), "INSERT INTO %s(%s) VALUES (", config.tableName.c_str(), columns));
-  // Never longer than the literal text, which fitted.
-  for (int i = 0; i < count && used + 3 < sizeof(sql); ++i) {
-    sql[used++] = i == 0 ? '?' : ',';
-    if (i > 0) sql[used++] = '?';
+  // The statement of the last column list, per thread: callers repeat theirs.
+  thread_local uint64_t lastOwner = 0;
+  thread_local std::string lastColumns;
+  thread_local std::string lastSql;
+  thread_local int lastCount = 0;
+  if (lastOwner != instanceId || lastColumns != columns) {
+    int columnCount = 1;
+    for (const char* c = columns; *c != '\0'; ++c) columnCount += *c == ',' ? 1 : 0;
+    std::string sql = "INSERT INTO " + config.tableName + "(" + columns + ") VALUES (";
+    for (int i = 0; i < columnCount; ++i) sql += i == 0 ? "?" : ",?";
+    sql += ");";
+    lastOwner = instanceId;
+    lastColumns = columns;
+    lastSql = sql;
+    lastCount = columnCount;
   }
-  if (used + 3 >= sizeof(sql)) return DbConnection::kNotRun;
-  memcpy(sql + used, ");", 3);
-  return conn->ExecKept(sql, bound, count);
+  // Miscounted lists fail on the text path, with its own answer.
+  if (lastCount != count) return DbConnection::kNotRun;
+  return conn->ExecKept(lastSql.c_str(), bound, count);
 }
 
 int BaseLogProvider::UpdateRows(const char* columns, const char* values, const char* where,

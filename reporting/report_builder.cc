@@ -6,6 +6,8 @@
 #include <string.h>
 #include <sys/time.h>
 
+#include <initializer_list>
+
 #include "base_log_provider.h"
 #include "db_connection.h"
 #include "log_manager.h"
@@ -106,6 +108,18 @@ __attribute__((format(printf, 4, 5))) void AppendF(char* buf, size_t size, size_
   int n = vsnprintf(buf + *len, size - *len, format, args);
   va_end(args);
   if (n > 0) *len = (*len + n < size) ? *len + n : size - 1;
+}
+
+// AppendF of "%s" pieces without the format: the same bytes, cut at the same place.
+void AppendTexts(char* buf, size_t size, size_t* len, std::initializer_list<const char*> texts) {
+  for (const char* text : texts) {
+    if (*len + 1 >= size) return;
+    size_t take = strlen(text);
+    if (take > size - 1 - *len) take = size - 1 - *len;
+    memcpy(buf + *len, text, take);
+    *len += take;
+    buf[*len] = '\0';
+  }
 }
 
 void FreeRows(char** rows, int rowCount) {
@@ -275,13 +289,13 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
   char body[kBodySize];
   size_t len = BeginBody(body, sizeof(body), date);
   if (agg.grouped) {
-    AppendF(body, sizeof(body), &len, "sum=%s%scount=%s", sumText, kSeparator,
-            fields[1 + keyCount]);
+    AppendTexts(body, sizeof(body), &len, {"sum=", sumText, kSeparator, "count=",
+                                           fields[1 + keyCount]});
   }
   for (int k = 0; k < keyCount; ++k) {
     const char* value = (hasSum && k == keyCount - 1) ? fields[fieldCount - 1] : fields[1 + k];
     bool first = !agg.grouped && k == 0;
-    AppendF(body, sizeof(body), &len, "%s%s=%s", first ? "" : kSeparator, agg.keys[k], value);
+    AppendTexts(body, sizeof(body), &len, {first ? "" : kSeparator, agg.keys[k], "=", value});
   }
   delete[] fields;
   return WriteRecord(agg.activity, body);
@@ -305,8 +319,8 @@ size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) {
   PrepareHead();
   size_t len = 0;
   body[0] = '\0';
-  // One format of the whole text, so a cut falls where it always did.
-  AppendF(body, size, &len, "%s%s%s", bodyHead.c_str(), date, kSeparator);
+  // Appended as one text, so a cut falls where it always did.
+  AppendTexts(body, size, &len, {bodyHead.c_str(), date, kSeparator});
   return len;
 }
 

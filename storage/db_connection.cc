@@ -496,10 +496,11 @@ void DbConnection::ReportError() {
 // ---- Kept statements and transactions ----------------------------------------------------
 
 sqlite3_stmt* DbConnection::TakeKept(const char* sql, StatementScope scope, const char* table) {
+  size_t length = strlen(sql);
   std::lock_guard<std::mutex> lock(keptMutex);
   for (KeptStatement& entry : kept) {
-    if (entry.stmt != nullptr && entry.scope == scope && entry.table == table &&
-        entry.sql == sql) {
+    if (entry.stmt != nullptr && entry.scope == scope && entry.sql.size() == length &&
+        memcmp(entry.sql.data(), sql, length) == 0 && entry.table == table) {
       sqlite3_stmt* stmt = entry.stmt;
       entry.stmt = nullptr;
       return stmt;
