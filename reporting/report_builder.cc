@@ -128,6 +128,17 @@ void FreeRows(char** rows, int rowCount) {
   delete[] rows;
 }
 
+// A select's rows, freed when they go out of scope: also when a stop ends the worker inside one
+// of their records' inserts, as the thread's unwinding runs this (memory only, no statement).
+struct SelectedRows {
+  SelectedRows() = default;
+  SelectedRows(const SelectedRows&) = delete;
+  SelectedRows& operator=(const SelectedRows&) = delete;
+  ~SelectedRows() { FreeRows(rows, count); }
+  char** rows = nullptr;
+  int count = 0;
+};
+
 }  // namespace
 
 int64_t SystemClockMs() {
@@ -250,20 +261,16 @@ int ReportBuilder::AggregateWindows(const Aggregation& agg, time_t day) {
     snprintf(where, sizeof(where), "timestamp >= %s and timestamp < %s", windowStart, windowEnd);
     BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(agg.table);
     if (provider == nullptr) return -1;
-    int rowCount = 0;
-    char** rows = nullptr;
-    int selected =
-        agg.grouped ? provider->SelectGroupedRows(columns, where, nullptr, group, &rowCount, &rows)
-                    : provider->SelectRows(columns, where, nullptr, &rowCount, &rows);
-    if (selected != 0) {
-      FreeRows(rows, rowCount);
-      return -1;
-    }
+    SelectedRows selected;
+    int rc = agg.grouped ? provider->SelectGroupedRows(columns, where, nullptr, group,
+                                                       &selected.count, &selected.rows)
+                         : provider->SelectRows(columns, where, nullptr, &selected.count,
+                                                &selected.rows);
+    if (rc != 0) return -1;
     int result = 0;
-    for (int i = 0; i < rowCount && result == 0 && rows != nullptr; ++i) {
-      result = WriteRow(agg, slice, sumText, rows[i]);
+    for (int i = 0; i < selected.count && result == 0 && selected.rows != nullptr; ++i) {
+      result = WriteRow(agg, slice, sumText, selected.rows[i]);
     }
-    FreeRows(rows, rowCount);
     if (result != 0) return -1;
   }
   return 0;
