@@ -7,6 +7,7 @@
 #include <stdlib.h>
 #include <sys/stat.h>
 #include <sys/time.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <map>
@@ -128,6 +129,90 @@ BENCHMARK(BM_BarePreparedInsert)
     ->Iterations(2000)
     ->Unit(benchmark::kMicrosecond);
 
+double CpuUs() {
+  struct timespec ts;
+  clock_gettime(CLOCK_THREAD_CPUTIME_ID, &ts);
+  return ts.tv_sec * 1e6 + ts.tv_nsec / 1e3;
+}
+
+double WallUs() {
+  struct timespec ts;
+  clock_gettime(CLOCK_MONOTONIC, &ts);
+  return ts.tv_sec * 1e6 + ts.tv_nsec / 1e3;
+}
+
+// Per insert, from the interleaved benchmark: [0] empty table, [1] at the limit.
+struct Interleaved {
+  double insertCpu = 0, insertWall = 0, bareCpu = 0, bareWall = 0;
+};
+Interleaved g_interleaved[2];
+
+// InsertRow and the bare insert taking turns on the same table (which goes first alternates),
+// so that both meet the same load; the table is held at its start size as above, untimed.
+void BM_InsertRowInterleavedWithBare(benchmark::State& state) {
+  int start = static_cast<int>(state.range(0));
+  Prefill(start);
+  sqlite3_stmt* stmt = nullptr;
+  if (sqlite3_prepare_v2(g_conn->Handle(),
+                         "INSERT INTO use_app_survey(app_id,duration,timestamp,time_zone) "
+                         "VALUES (?,?,?,?);",
+                         -1, &stmt, nullptr) != SQLITE_OK)
+    abort();
+  Interleaved sum;
+  int64_t done = 0;
+  auto insertRow = [&] {
+    double cpu = CpuUs(), wall = WallUs();
+    if (g_provider->InsertRow("app_id,duration", "'com.example.clock',184230") != 0)
+      state.SkipWithError("insert failed");
+    sum.insertCpu += CpuUs() - cpu;
+    sum.insertWall += WallUs() - wall;
+  };
+  auto bare = [&] {
+    double cpu = CpuUs(), wall = WallUs();
+    sqlite3_bind_text(stmt, 1, "com.example.clock", -1, SQLITE_STATIC);
+    sqlite3_bind_int64(stmt, 2, 184230);
+    sqlite3_bind_int64(stmt, 3, NowMs());
+    sqlite3_bind_text(stmt, 4, "Europe/Berlin", -1, SQLITE_STATIC);
+    if (sqlite3_step(stmt) != SQLITE_DONE) state.SkipWithError("insert failed");
+    sqlite3_reset(stmt);
+    sum.bareCpu += CpuUs() - cpu;
+    sum.bareWall += WallUs() - wall;
+  };
+  for (auto _ : state) {
+    if (done % 2 == 0) {
+      insertRow();
+      bare();
+    } else {
+      bare();
+      insertRow();
+    }
+    ++done;
+    if (done % kBatch == 0) {
+      state.PauseTiming();
+      if (start == 0) {
+        Prefill(0);
+      } else {  // the bare inserts' share; InsertRow trims its own
+        g_conn->Exec(
+            "DELETE FROM use_app_survey WHERE _id < (SELECT MIN(_id) FROM "
+            "use_app_survey) + 500;");
+      }
+      state.ResumeTiming();
+    }
+  }
+  sqlite3_finalize(stmt);
+  double n = static_cast<double>(state.iterations());
+  Interleaved& out = g_interleaved[start == 0 ? 0 : 1];
+  out = {sum.insertCpu / n, sum.insertWall / n, sum.bareCpu / n, sum.bareWall / n};
+  state.counters["insert_cpu_us"] = out.insertCpu;
+  state.counters["bare_cpu_us"] = out.bareCpu;
+  state.counters["rows_at_end"] = g_conn->Count("use_app_survey");
+}
+BENCHMARK(BM_InsertRowInterleavedWithBare)
+    ->Arg(0)
+    ->Arg(kLimit)
+    ->Iterations(4000)
+    ->Unit(benchmark::kMicrosecond);
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -148,6 +233,16 @@ int main(int argc, char** argv) {
     printf("%s InsertRow / bare insert, empty table:     %.2f\n", kind, empty / bareEmpty);
     printf("%s InsertRow / bare insert, at 5,000 rows:   %.2f\n", kind, full / bareFull);
     printf("%s InsertRow at 5,000 rows / empty table:    %.2f\n", kind, full / empty);
+  }
+  // The same ratios from the interleaved runs, per insert.
+  for (int i = 0; i < 2; ++i) {
+    const Interleaved& t = g_interleaved[i];
+    if (t.bareCpu <= 0 || t.bareWall <= 0) continue;
+    const char* where = i == 0 ? "empty table" : "at 5,000 rows";
+    printf("interleaved, %-13s InsertRow %.1f us cpu / %.1f us wall, bare %.1f / %.1f: "
+           "cpu %.2f, wall %.2f\n",
+           where, t.insertCpu, t.insertWall, t.bareCpu, t.bareWall, t.insertCpu / t.bareCpu,
+           t.insertWall / t.bareWall);
   }
   benchmark::Shutdown();
   return 0;

@@ -3,14 +3,22 @@
 #ifndef LOGMGR_INCLUDE_BASE_LOG_PROVIDER_H_
 #define LOGMGR_INCLUDE_BASE_LOG_PROVIDER_H_
 
+#include <stddef.h>
 #include <stdint.h>
 
 #include <string>
 #include <vector>
 
+#include "db_connection.h"
+
 namespace _CorvaneLogManager {
 
-class DbConnection;
+// Reads a value list made only of plain literals, each standing for exactly what SQLite stores
+// from it: a quoted string ('' for '), an integer of up to 18 digits with an optional leading
+// "-", or NULL, separated by commas and SQL blanks. Fills |out| (room for |room| values), texts
+// decoded into |decoded|; the count, or -1 for anything else (the text path serves it).
+int ParsePlainLiterals(const char* text, DbConnection::BoundValue* out, int room, char* decoded,
+                       size_t decodedSize);
 
 // What a database manager keeps of the providers whose tables live in its file.
 class IDbResponseListener {
@@ -70,6 +78,9 @@ class BaseLogProvider : public IDbResponseListener {
   // provider living in another database file reuses them.
   int InsertOn(DbConnection* conn, const char* columns, const char* values, int32_t* rowId,
                bool countRows);
+  // The insert from the connection's kept statement when every value is a plain literal (see
+  // ParsePlainLiterals); DbConnection::kNotRun when it cannot serve, nothing run.
+  int InsertKept(DbConnection* conn, const char* columns, const char* values);
   // |splitDelims| is where the two lists are cut into tokens before pairing.
   int UpdateOn(DbConnection* conn, const char* columns, const char* values, const char* where,
                int32_t* count, bool autoColumns, const char* splitDelims);
@@ -77,6 +88,11 @@ class BaseLogProvider : public IDbResponseListener {
   int DeleteOldestOn(DbConnection* conn);
 
   TableConfig config;
+
+ private:
+  static uint64_t NewInstanceId();
+  // Names this provider in per-thread caches; an address may be reused, this never is.
+  uint64_t instanceId = NewInstanceId();
 };
 
 }  // namespace _CorvaneLogManager

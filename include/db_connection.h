@@ -13,6 +13,8 @@
 #include <stdint.h>
 
 #include <atomic>
+#include <mutex>
+#include <string>
 
 #include "storage/statement_policy.h"
 
@@ -96,6 +98,33 @@ class DbConnection {
   // Shortens the bus budget (tests and benchmarks); the default fits the daemon.
   void SetBusCpuBudgetMs(int ms) { busBudgetMs = ms; }
 
+  // ---- Kept statements and transactions -------------------------------------------------
+  // One value bound to a kept statement, standing for the literal its text would carry.
+  struct BoundValue {
+    enum Kind { kNull, kInteger, kText } kind;
+    int64_t integer;
+    const char* text;  // |length| bytes, no terminator needed
+    int length;
+  };
+  // ExecKept's answer when it ran nothing: the caller runs the statement's literal text.
+  static constexpr int kNotRun = 1;
+  // Runs |sql|, one statement whose "?"s take |values| in order, from a statement kept per
+  // text and per scope. SQLite asks the authorizer at prepare time only, so a kept statement
+  // serves only the scope it was judged for: the daemon's own, or a bus request's of the same
+  // table. Answers (0 / -1, row id, changes, an interrupt or a spent budget) as Exec does for
+  // the text with the values written as literals; kNotRun, with nothing run, in the open
+  // phase or when |sql| does not prepare.
+  int ExecKept(const char* sql, const BoundValue* values, int count);
+  // The calling thread's transaction: BEGIN and COMMIT through Exec (0 / -1). A commit that
+  // fails is rolled back, so nothing stays open after either answer.
+  int BeginTransaction();
+  int CommitTransaction();
+  // Rolls back a transaction left open: by a failed step, or by a thread ended inside it
+  // (Interrupt). For a normal caller only, never an unwinding one. 0 also when none was open.
+  int RollBackOpenTransaction();
+  bool InTransaction() const;
+  // ---- end of kept statements and transactions -------------------------------------------
+
  private:
   static int OnProgress(void* self);
   static int OnAuthorize(void* self, int action, const char* arg1, const char* arg2,
@@ -139,6 +168,24 @@ class DbConnection {
   // Pending interrupt; consumed by the statement it ends, dropped by Close.
   std::atomic<bool> stopRequested{false};
   std::atomic<pthread_t> stopRequester{};
+
+  // ---- Kept statements -------------------------------------------------------------------
+  struct KeptStatement {
+    std::string sql;
+    StatementScope scope = StatementScope::kDaemon;
+    std::string table;  // the bus request's table; empty for the daemon's own
+    sqlite3_stmt* stmt = nullptr;
+  };
+  static constexpr int kKeptStatements = 16;
+  // A statement is taken out while it runs, so two threads never share one, and a thread
+  // ended inside it (which finalises it) leaves nothing dangling here.
+  sqlite3_stmt* TakeKept(const char* sql, StatementScope scope, const char* table);
+  void ReturnKept(const char* sql, StatementScope scope, const char* table, sqlite3_stmt* stmt);
+  void DropKept();
+  std::mutex keptMutex;
+  KeptStatement kept[kKeptStatements];
+  int keptNext = 0;  // the slot a new statement replaces when all are used
+  // ---- end of kept statements ------------------------------------------------------------
 };
 
 // Process-wide encryption switch: off at start and never turned on by the daemon.

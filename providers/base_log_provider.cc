@@ -2,8 +2,11 @@
 
 #include <stdio.h>
 #include <string.h>
+#include <strings.h>
 #include <sys/time.h>
 #include <unistd.h>
+
+#include <atomic>
 
 #include "db_connection.h"
 #include "platform/fixed_path.h"
@@ -32,7 +35,90 @@ DbConnection* SurveyConnection() {
   return manager == nullptr ? nullptr : manager->GetConnection();
 }
 
+// values += "," + the decimal text of |n|, as "%lld" writes it (once per insert, so no printf).
+void AppendCommaAndNumber(std::string* values, long long n) {
+  char text[24];
+  char* end = text + sizeof(text);
+  char* p = end;
+  unsigned long long magnitude =
+      n < 0 ? 0ULL - static_cast<unsigned long long>(n) : static_cast<unsigned long long>(n);
+  do {
+    *--p = static_cast<char>('0' + magnitude % 10);
+    magnitude /= 10;
+  } while (magnitude != 0);
+  if (n < 0) *--p = '-';
+  *--p = ',';
+  values->append(p, static_cast<size_t>(end - p));
+}
+
+bool IsSqlBlank(char c) { return c == ' ' || c == '\t' || c == '\n' || c == '\r' || c == '\f'; }
+
+bool EndsToken(char c) { return c == '\0' || c == ',' || IsSqlBlank(c); }
+
 }  // namespace
+
+int ParsePlainLiterals(const char* text, DbConnection::BoundValue* out, int room, char* decoded,
+                       size_t decodedSize) {
+  const char* p = text;
+  size_t used = 0;
+  int count = 0;
+  for (;;) {
+    while (IsSqlBlank(*p)) ++p;
+    if (count == room) return -1;
+    DbConnection::BoundValue& value = out[count];
+    if (*p == '\'') {
+      // A string literal: up to the quote not followed by another; "''" stands for "'".
+      size_t start = used;
+      ++p;
+      for (;;) {
+        // Up to the next quote in one copy: a record body is a few hundred bytes.
+        const char* quote = strchr(p, '\'');
+        if (quote == nullptr) return -1;  // unterminated
+        size_t run = static_cast<size_t>(quote - p);
+        bool doubled = quote[1] == '\'';
+        if (used + run + (doubled ? 1 : 0) >= decodedSize) return -1;
+        memcpy(decoded + used, p, run);
+        used += run;
+        if (!doubled) {
+          p = quote + 1;  // past the closing quote
+          break;
+        }
+        decoded[used++] = '\'';
+        p = quote + 2;
+      }
+      value = {DbConnection::BoundValue::kText, 0, decoded + start,
+               static_cast<int>(used - start)};
+    } else if ((*p >= '0' && *p <= '9') || (*p == '-' && p[1] >= '0' && p[1] <= '9')) {
+      // An integer of at most 18 digits: what SQLite reads from it is exactly this value, never
+      // a real. "-" right before the digits negates it, as the statement's unary minus would.
+      bool negative = *p == '-';
+      if (negative) ++p;
+      int64_t number = 0;
+      int digits = 0;
+      for (; *p >= '0' && *p <= '9'; ++p, ++digits) {
+        if (digits == 18) return -1;
+        number = number * 10 + (*p - '0');
+      }
+      if (!EndsToken(*p)) return -1;  // a real, hex, a digit separator, a word
+      value = {DbConnection::BoundValue::kInteger, negative ? -number : number, nullptr, 0};
+    } else if (strncasecmp(p, "null", 4) == 0 && EndsToken(p[4])) {
+      p += 4;
+      value = {DbConnection::BoundValue::kNull, 0, nullptr, 0};
+    } else {
+      return -1;  // an expression, a blob, a quoted name, a comment...
+    }
+    ++count;
+    while (IsSqlBlank(*p)) ++p;
+    if (*p == '\0') return count;
+    if (*p != ',') return -1;
+    ++p;
+  }
+}
+
+uint64_t BaseLogProvider::NewInstanceId() {
+  static std::atomic<uint64_t> last{0};
+  return ++last;
+}
 
 int BaseLogProvider::InitTableConfig(const char* tableName, const char* columnList,
                                      int32_t retentionDays, int32_t checkInterval, int32_t maxRows,
@@ -53,6 +139,11 @@ int BaseLogProvider::InitTableConfig(const char* tableName, const char* columnLi
 
 int BaseLogProvider::ValidateColumns(const char* columnList) {
   if (columnList == nullptr) return 0;
+  // The declared columns never change, so a list found valid stays valid: collectors and the
+  // report builder repeat theirs on every insert. Per thread, as providers serve two.
+  thread_local uint64_t validOwner = 0;
+  thread_local std::string validList;
+  if (validOwner == instanceId && validList == columnList) return 0;
   char buf[kListSize];
   CopyListOrDie(buf, columnList);
   char* save = nullptr;
@@ -68,16 +159,17 @@ int BaseLogProvider::ValidateColumns(const char* columnList) {
     }
     if (!declared) return -1;
   }
+  validOwner = instanceId;
+  validList = columnList;
   return 0;
 }
 
 void BaseLogProvider::AppendAutoColumns(std::string* columns, std::string* values) {
   for (const std::string& column : config.columns) {
+    if (column[0] != 't') continue;  // neither automatic column
     if (column == "timestamp") {
-      char now[32];
-      snprintf(now, sizeof(now), ",%lld", NowMs());
       columns->append(",timestamp");
-      values->append(now);
+      AppendCommaAndNumber(values, NowMs());
     } else if (column == "time_zone") {
       char pathBuf[4096];
       const char* link = logmgr_fixed_path("/opt/etc/localtime", pathBuf, sizeof(pathBuf));
@@ -137,22 +229,60 @@ int BaseLogProvider::InsertRow(const char* columns, const char* values, int32_t*
 int BaseLogProvider::InsertOn(DbConnection* conn, const char* columns, const char* values,
                               int32_t* rowId, bool countRows) {
   if (conn == nullptr || columns == nullptr || values == nullptr) return -1;
-  std::string columnText(columns);
-  std::string valueText(values);
+  std::string columnText;
+  std::string valueText;
+  // Room for the automatic columns up front: appending them then copies nothing.
+  columnText.reserve(strlen(columns) + 32);
+  valueText.reserve(strlen(values) + 80);
+  columnText.append(columns);
+  valueText.append(values);
   if (columnText.empty() || valueText.empty()) return -1;
   if (ValidateColumns(columnText.c_str()) != 0) return -1;
   AppendAutoColumns(&columnText, &valueText);
   int32_t check = countRows ? TickInsertCounter() : 0;
 
   char sql[kStatementSize];
-  snprintf(sql, sizeof(sql), "INSERT INTO %s(%s) VALUES (%s);", config.tableName.c_str(),
-           columnText.c_str(), valueText.c_str());
-  int result = conn->Exec(sql);
+  size_t length = sizeof("INSERT INTO () VALUES ();") - 1 + config.tableName.size() +
+                  columnText.size() + valueText.size();
+  int result = DbConnection::kNotRun;
+  // Only a text that fits the buffer may be served otherwise; a cut one is run as cut.
+  if (length < sizeof(sql)) result = InsertKept(conn, columnText.c_str(), valueText.c_str());
+  if (result == DbConnection::kNotRun) {
+    snprintf(sql, sizeof(sql), "INSERT INTO %s(%s) VALUES (%s);", config.tableName.c_str(),
+             columnText.c_str(), valueText.c_str());
+    result = conn->Exec(sql);
+  }
   if (rowId != nullptr) *rowId = result == 0 ? conn->LastInsertRowId() : -1;
   if (result != 0) return -1;
   // Counting rows costs a full scan, so only the insert that wraps the counter does it.
   if (check > 0 && GetRowCount() > config.max_rows) (void)DeleteOldestRows();
   return 0;
+}
+
+int BaseLogProvider::InsertKept(DbConnection* conn, const char* columns, const char* values) {
+  DbConnection::BoundValue bound[kListSize];
+  char decoded[kStatementSize];
+  int count = ParsePlainLiterals(values, bound, kListSize, decoded, sizeof(decoded));
+  if (count <= 0) return DbConnection::kNotRun;
+  // The statement of the last column list, per thread: callers repeat theirs.
+  thread_local uint64_t lastOwner = 0;
+  thread_local std::string lastColumns;
+  thread_local std::string lastSql;
+  thread_local int lastCount = 0;
+  if (lastOwner != instanceId || lastColumns != columns) {
+    int columnCount = 1;
+    for (const char* c = columns; *c != '\0'; ++c) columnCount += *c == ',' ? 1 : 0;
+    std::string sql = "INSERT INTO " + config.tableName + "(" + columns + ") VALUES (";
+    for (int i = 0; i < columnCount; ++i) sql += i == 0 ? "?" : ",?";
+    sql += ");";
+    lastOwner = instanceId;
+    lastColumns = columns;
+    lastSql = sql;
+    lastCount = columnCount;
+  }
+  // Miscounted lists fail on the text path, with its own answer.
+  if (lastCount != count) return DbConnection::kNotRun;
+  return conn->ExecKept(lastSql.c_str(), bound, count);
 }
 
 int BaseLogProvider::UpdateRows(const char* columns, const char* values, const char* where,

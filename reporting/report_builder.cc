@@ -6,12 +6,16 @@
 #include <string.h>
 #include <sys/time.h>
 
+#include <initializer_list>
+
 #include "base_log_provider.h"
+#include "db_connection.h"
 #include "log_manager.h"
 #include "provider_registry.h"
 #include "reporting/local_midnight.h"
 #include "reporting/row_splitter.h"
 #include "sql_literal.h"
+#include "storage/db_manager.h"
 #include "storage/pref_store.h"
 
 namespace _CorvaneLogManager {
@@ -106,11 +110,34 @@ __attribute__((format(printf, 4, 5))) void AppendF(char* buf, size_t size, size_
   if (n > 0) *len = (*len + n < size) ? *len + n : size - 1;
 }
 
+// AppendF of "%s" pieces without the format: the same bytes, cut at the same place.
+void AppendTexts(char* buf, size_t size, size_t* len, std::initializer_list<const char*> texts) {
+  for (const char* text : texts) {
+    if (*len + 1 >= size) return;
+    size_t take = strlen(text);
+    if (take > size - 1 - *len) take = size - 1 - *len;
+    memcpy(buf + *len, text, take);
+    *len += take;
+    buf[*len] = '\0';
+  }
+}
+
 void FreeRows(char** rows, int rowCount) {
   if (rows == nullptr) return;
   for (int i = 0; i < rowCount; ++i) delete[] rows[i];
   delete[] rows;
 }
+
+// A select's rows, freed when they go out of scope: also when a stop ends the worker inside one
+// of their records' inserts, as the thread's unwinding runs this (memory only, no statement).
+struct SelectedRows {
+  SelectedRows() = default;
+  SelectedRows(const SelectedRows&) = delete;
+  SelectedRows& operator=(const SelectedRows&) = delete;
+  ~SelectedRows() { FreeRows(rows, count); }
+  char** rows = nullptr;
+  int count = 0;
+};
 
 }  // namespace
 
@@ -133,9 +160,23 @@ const char* ReportBuilder::AppVersion() const {
   return identity.Firmware() != nullptr ? identity.Firmware() : kDefaultVersion;
 }
 
+namespace {
+
+DbConnection* QueueConnection() {
+  UploadDbManager* manager = UploadDbManager::GetInstance();
+  return manager != nullptr ? manager->GetConnection() : nullptr;
+}
+
+}  // namespace
+
 int ReportBuilder::RunDaily() {
   if (!GetRuntimeSwitch(1)) return -1;
+  // A worker stopped inside a table's transaction leaves it open; its records were never
+  // committed and that table's rows are still there, so dropping them loses nothing.
+  DbConnection* queueConn = QueueConnection();
+  if (queueConn != nullptr && queueConn->RollBackOpenTransaction() != 0) return -1;
   (void)identity.Refresh();
+  headReady = false;  // the identity may have changed
   PrefStore* prefs = Prefs();
   if (prefs == nullptr) return -1;
   time_t now = static_cast<time_t>((clockFn != nullptr ? clockFn() : SystemClockMs()) / 1000);
@@ -188,6 +229,20 @@ void ReportBuilder::ComputeWindow(time_t day, int mode, int offsetHours, int len
 }
 
 int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
+  // The table's records go into the queue in one transaction, committed before its rows are
+  // purged: a kill or a failure before the commit leaves neither records nor a purge.
+  // Without a queue a record fails at its insert, as it always did.
+  DbConnection* queueConn = QueueConnection();
+  if (queueConn != nullptr && queueConn->BeginTransaction() != 0) return -1;
+  if (AggregateWindows(agg, day) != 0) {
+    if (queueConn != nullptr) (void)queueConn->RollBackOpenTransaction();
+    return -1;
+  }
+  if (queueConn != nullptr && queueConn->CommitTransaction() != 0) return -1;
+  return PurgeTable(agg.table, windowEnd);
+}
+
+int ReportBuilder::AggregateWindows(const Aggregation& agg, time_t day) {
   bool slice = g_sliceMode && agg.sliceWindows > 0;
   char columns[320];
   snprintf(columns, sizeof(columns), "%s%s", agg.columns,
@@ -206,23 +261,19 @@ int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
     snprintf(where, sizeof(where), "timestamp >= %s and timestamp < %s", windowStart, windowEnd);
     BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(agg.table);
     if (provider == nullptr) return -1;
-    int rowCount = 0;
-    char** rows = nullptr;
-    int selected =
-        agg.grouped ? provider->SelectGroupedRows(columns, where, nullptr, group, &rowCount, &rows)
-                    : provider->SelectRows(columns, where, nullptr, &rowCount, &rows);
-    if (selected != 0) {
-      FreeRows(rows, rowCount);
-      return -1;
-    }
+    SelectedRows selected;
+    int rc = agg.grouped ? provider->SelectGroupedRows(columns, where, nullptr, group,
+                                                       &selected.count, &selected.rows)
+                         : provider->SelectRows(columns, where, nullptr, &selected.count,
+                                                &selected.rows);
+    if (rc != 0) return -1;
     int result = 0;
-    for (int i = 0; i < rowCount && result == 0 && rows != nullptr; ++i) {
-      result = WriteRow(agg, slice, sumText, rows[i]);
+    for (int i = 0; i < selected.count && result == 0 && selected.rows != nullptr; ++i) {
+      result = WriteRow(agg, slice, sumText, selected.rows[i]);
     }
-    FreeRows(rows, rowCount);
     if (result != 0) return -1;
   }
-  return PurgeTable(agg.table, windowEnd);
+  return 0;
 }
 
 int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumText,
@@ -245,25 +296,38 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
   char body[kBodySize];
   size_t len = BeginBody(body, sizeof(body), date);
   if (agg.grouped) {
-    AppendF(body, sizeof(body), &len, "sum=%s%scount=%s", sumText, kSeparator,
-            fields[1 + keyCount]);
+    AppendTexts(body, sizeof(body), &len, {"sum=", sumText, kSeparator, "count=",
+                                           fields[1 + keyCount]});
   }
   for (int k = 0; k < keyCount; ++k) {
     const char* value = (hasSum && k == keyCount - 1) ? fields[fieldCount - 1] : fields[1 + k];
     bool first = !agg.grouped && k == 0;
-    AppendF(body, sizeof(body), &len, "%s%s=%s", first ? "" : kSeparator, agg.keys[k], value);
+    AppendTexts(body, sizeof(body), &len, {first ? "" : kSeparator, agg.keys[k], "=", value});
   }
   delete[] fields;
   return WriteRecord(agg.activity, body);
 }
 
-size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) const {
+void ReportBuilder::PrepareHead() {
+  if (headReady) return;
+  char head[kBodySize];
   size_t len = 0;
-  body[0] = '\0';
-  AppendF(body, size, &len, "mcc=%s%smnc=%s%sdid=%smodel=%s%sfw_ver=%s%sdate=%s%s",
+  head[0] = '\0';
+  AppendF(head, sizeof(head), &len, "mcc=%s%smnc=%s%sdid=%smodel=%s%sfw_ver=%s%sdate=",
           DeviceText(identity.Mcc()).c_str(), kSeparator, DeviceText(identity.Mnc()).c_str(),
           kSeparator, kSeparator, DeviceText(identity.Model()).c_str(), kSeparator,
-          DeviceText(AppVersion()).c_str(), kSeparator, date, kSeparator);
+          DeviceText(AppVersion()).c_str(), kSeparator);
+  bodyHead = head;
+  recordVersion = DeviceText(AppVersion());
+  headReady = true;
+}
+
+size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) {
+  PrepareHead();
+  size_t len = 0;
+  body[0] = '\0';
+  // Appended as one text, so a cut falls where it always did.
+  AppendTexts(body, size, &len, {bodyHead.c_str(), date, kSeparator});
   return len;
 }
 
@@ -279,7 +343,8 @@ int ReportBuilder::WriteSummary(const char* renderedDay) {
 int ReportBuilder::WriteRecord(const char* activity, const char* body) {
   char values[kValuesSize];
   snprintf(values, sizeof(values), "'701','999','%s','BIZ','", activity);
-  (void)AppendQuoted(values, sizeof(values), DeviceText(AppVersion()).c_str());
+  PrepareHead();
+  (void)AppendQuoted(values, sizeof(values), recordVersion.c_str());
   size_t used = strlen(values);
   snprintf(values + used, sizeof(values) - used, "','");
   // The body is stored whole when the statement holds it, else up to the last whole UTF-8

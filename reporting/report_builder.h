@@ -76,11 +76,16 @@ class ReportBuilder {
 
  private:
   PrefStore* Prefs() const;
+  // One table's day: its records in one queue transaction, then the purge of its rows.
   int Aggregate(const Aggregation& agg, time_t day);
+  int AggregateWindows(const Aggregation& agg, time_t day);
   int WriteRow(const Aggregation& agg, bool slice, const char* sumText, char* rowText);
   int WriteSummary(const char* renderedDay);
   // Header pairs and the date pair, each followed by the separator.
-  size_t BeginBody(char* body, size_t size, const char* date) const;
+  size_t BeginBody(char* body, size_t size, const char* date);
+  // The header pairs before the date and the record's version text, built once per identity
+  // rather than per record.
+  void PrepareHead();
 
   char windowStart[24] = "";
   char windowEnd[24] = "";
@@ -88,6 +93,9 @@ class ReportBuilder {
   DeviceIdentity identity;
   PrefStore* prefStore = nullptr;
   ReportClock clockFn = nullptr;
+  std::string bodyHead;
+  std::string recordVersion;
+  bool headReady = false;
 };
 
 }  // namespace _CorvaneLogManager

@@ -12,6 +12,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <mutex>
 #include <new>
 #include <string>
 
@@ -562,6 +563,7 @@ void DbConnection::Interrupt() {
 
 int DbConnection::Close() {
   if (db == nullptr) return -1;
+  DropKept();
   sqlite3_stmt* stmt = nullptr;
   while ((stmt = sqlite3_next_stmt(db, nullptr)) != nullptr) (void)sqlite3_finalize(stmt);
   if (sqlite3_close(db) != SQLITE_OK) {
@@ -576,5 +578,135 @@ int DbConnection::Close() {
 void DbConnection::ReportError() {
   if (db != nullptr) (void)sqlite3_errmsg(db);  // nothing is logged
 }
+
+// ---- Kept statements and transactions ----------------------------------------------------
+
+sqlite3_stmt* DbConnection::TakeKept(const char* sql, StatementScope scope, const char* table) {
+  size_t length = strlen(sql);
+  std::lock_guard<std::mutex> lock(keptMutex);
+  for (KeptStatement& entry : kept) {
+    if (entry.stmt != nullptr && entry.scope == scope && entry.sql.size() == length &&
+        memcmp(entry.sql.data(), sql, length) == 0 && entry.table == table) {
+      sqlite3_stmt* stmt = entry.stmt;
+      entry.stmt = nullptr;
+      return stmt;
+    }
+  }
+  return nullptr;
+}
+
+void DbConnection::ReturnKept(const char* sql, StatementScope scope, const char* table,
+                              sqlite3_stmt* stmt) {
+  (void)sqlite3_reset(stmt);
+  (void)sqlite3_clear_bindings(stmt);
+  std::lock_guard<std::mutex> lock(keptMutex);
+  KeptStatement* slot = nullptr;
+  for (KeptStatement& entry : kept) {
+    if (entry.stmt == nullptr && entry.scope == scope && entry.table == table && entry.sql == sql) {
+      slot = &entry;  // its own slot, emptied when it was taken
+      break;
+    }
+  }
+  for (int i = 0; slot == nullptr && i < kKeptStatements; ++i) {
+    if (kept[i].stmt == nullptr && kept[i].sql.empty()) slot = &kept[i];
+  }
+  if (slot == nullptr) {
+    slot = &kept[keptNext];
+    keptNext = (keptNext + 1) % kKeptStatements;
+  }
+  if (slot->stmt != nullptr) {
+    // Another thread kept the same text meanwhile, or an old text gives way.
+    if (slot->sql == sql && slot->scope == scope && slot->table == table) {
+      sqlite3_finalize(stmt);
+      return;
+    }
+    sqlite3_finalize(slot->stmt);
+  }
+  slot->sql = sql;
+  slot->scope = scope;
+  slot->table = table;
+  slot->stmt = stmt;
+}
+
+void DbConnection::DropKept() {
+  std::lock_guard<std::mutex> lock(keptMutex);
+  for (KeptStatement& entry : kept) {
+    if (entry.stmt != nullptr) sqlite3_finalize(entry.stmt);
+    entry = KeptStatement();
+  }
+  keptNext = 0;
+}
+
+int DbConnection::ExecKept(const char* sql, const BoundValue* values, int count) {
+  if (sql == nullptr || db == nullptr || (count > 0 && values == nullptr)) return -1;
+  StatementScope current = ScopeOfThisThread();
+  if (current == StatementScope::kSetup) return kNotRun;
+  // The table is part of the key: a statement judged for one bus request's table is never
+  // run for another's, nor one judged for the daemon for any bus request.
+  const char* table =
+      current == StatementScope::kBusRequest && scopeTable != nullptr ? scopeTable : "";
+  BeginStatement();
+  sqlite3_stmt* stmt = TakeKept(sql, current, table);
+  if (stmt == nullptr) {
+    // Cancellation stays off as after Exec's prepare; the caller's Exec settles it.
+    if (!PrepareOrFail(sql, &stmt, false)) return kNotRun;
+    if (sqlite3_bind_parameter_count(stmt) != count) {
+      sqlite3_finalize(stmt);
+      return kNotRun;
+    }
+  }
+  for (int i = 0; i < count; ++i) {
+    const BoundValue& value = values[i];
+    int rc = SQLITE_OK;
+    switch (value.kind) {
+      case BoundValue::kNull:
+        rc = sqlite3_bind_null(stmt, i + 1);
+        break;
+      case BoundValue::kInteger:
+        rc = sqlite3_bind_int64(stmt, i + 1, value.integer);
+        break;
+      case BoundValue::kText:
+        rc = sqlite3_bind_text(stmt, i + 1, value.text, value.length, SQLITE_STATIC);
+        break;
+    }
+    if (rc != SQLITE_OK) {
+      sqlite3_finalize(stmt);
+      return kNotRun;
+    }
+  }
+  int rc;
+  // As in Exec: the counts are taken under the connection's mutex.
+  sqlite3_mutex* mutex = sqlite3_db_mutex(db);
+  sqlite3_mutex_enter(mutex);
+  while ((rc = sqlite3_step(stmt)) == SQLITE_ROW) {
+  }
+  t_lastExec = {this, sqlite3_changes(db), sqlite3_last_insert_rowid(db)};
+  sqlite3_mutex_leave(mutex);
+  if (rc == SQLITE_INTERRUPT) {
+    EndThreadUnlessBudgetSpent(stmt);
+    return -1;
+  }
+  ReturnKept(sql, current, table, stmt);
+  if (rc == SQLITE_DONE) {
+    EnableCancel();
+    return 0;
+  }
+  return -1;
+}
+
+int DbConnection::BeginTransaction() { return Exec("BEGIN;"); }
+
+int DbConnection::CommitTransaction() {
+  if (Exec("COMMIT;") == 0) return 0;
+  (void)RollBackOpenTransaction();
+  return -1;
+}
+
+int DbConnection::RollBackOpenTransaction() {
+  if (db == nullptr || !InTransaction()) return 0;
+  return Exec("ROLLBACK;");
+}
+
+bool DbConnection::InTransaction() const { return db != nullptr && sqlite3_get_autocommit(db) == 0; }
 
 }  // namespace _CorvaneLogManager

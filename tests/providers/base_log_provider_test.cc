@@ -155,6 +155,101 @@ TEST_F(BaseLogProviderTest, ExpiryKeepsStatusTenDaysAndTheRestThree) {
   }
 }
 
+// A plain-literal insert runs from a kept statement with its values bound; what it stores and
+// answers must be what the text statement stores and answers: each value with the same type
+// after the column's affinity, the same row id, the same failures.
+TEST_F(BaseLogProviderTest, KeptInsertsStoreAndAnswerAsTheTextWould) {
+  sqlite3* raw = nullptr;  // the text statement, on a connection of its own
+  ASSERT_EQ(sqlite3_open((sysroot + "/opt/usr/dbspace/.SurveyLog.db").c_str(), &raw), SQLITE_OK);
+  auto stored = [&](long long id) {
+    return Query(survey, "SELECT typeof(app_id)||':'||quote(app_id)||'|'||typeof(duration)||':'"
+                         "||quote(duration) FROM use_app_survey WHERE _id=" + std::to_string(id));
+  };
+  const char* values[] = {
+      "'com.example',12", "'12',' 34'", "'x''y''', -0", " NULL , '7' ", "'a',123456789012345678",
+      "'a',-987654321", "'a','3.0'", "'\xC3\xA9\xFF',null", "'',''",
+      "007,8", "-0,-0", "NULL,NULL",  // into the text column: numbers as SQLite writes them
+      // Not plain literals: the text path stores them.
+      "'a',1234567890123456789", "'a',99999999999999999999", "'a',1.5", "'a',0x10", "'a',1e3",
+      "'a',-'3'", "'a',+4", "'a'||'b',1", "'a' 'b',1", "\"a\",1", "'a',X'41'", "'a',1_000"};
+  for (const char* v : values) {
+    SCOPED_TRACE(v);
+    int32_t rowId = 0;
+    int result = useApp->InsertRow("app_id,duration", v, &rowId);
+    std::string text = std::string("INSERT INTO use_app_survey(app_id,duration) VALUES (") + v + ");";
+    int rawResult = sqlite3_exec(raw, text.c_str(), nullptr, nullptr, nullptr);
+    ASSERT_EQ(result, rawResult == SQLITE_OK ? 0 : -1);
+    if (result != 0) continue;
+    EXPECT_EQ(rowId, survey->LastInsertRowId());
+    EXPECT_EQ(survey->Changes(), 1);
+    EXPECT_EQ(stored(rowId), stored(sqlite3_last_insert_rowid(raw)));
+  }
+  bool kept = false;
+  for (sqlite3_stmt* s = sqlite3_next_stmt(survey->Handle(), nullptr); s != nullptr;
+       s = sqlite3_next_stmt(survey->Handle(), s)) {
+    kept = kept || std::string(sqlite3_sql(s)) ==
+                       "INSERT INTO use_app_survey(app_id,duration,timestamp,time_zone) "
+                       "VALUES (?,?,?,?);";
+  }
+  EXPECT_TRUE(kept) << "the plain inserts must have run from a kept statement";
+
+  // Failures answer as the text's do: no row id, nothing stored.
+  long long rows = Number(survey, "SELECT count(*) FROM use_app_survey");
+  struct {
+    const char* columns;
+    const char* values;
+  } failing[] = {{"_id,app_id", "'x','a'"},  // not an integer for the row id
+                 {"_id,app_id", "1,'a'"},    // that row id is taken
+                 {"app_id,duration", "'a'"}, {"app_id", "'a',1"}, {"app_id", "'a"}};
+  for (const auto& f : failing) {
+    SCOPED_TRACE(f.values);
+    int32_t rowId = 0;
+    EXPECT_EQ(useApp->InsertRow(f.columns, f.values, &rowId), -1);
+    EXPECT_EQ(rowId, -1);
+  }
+  EXPECT_EQ(Number(survey, "SELECT count(*) FROM use_app_survey"), rows);
+
+  // Around the 1024-byte buffer: a whole text, one cut at its ";" (still a statement), and one
+  // cut inside its literal (none).
+  std::string fixed = "INSERT INTO use_app_survey(app_id,timestamp,time_zone) VALUES ('',"
+                      "1234567890123,'Europe/Berlin');";
+  for (size_t length : {size_t{1023}, size_t{1024}, size_t{1025}}) {
+    SCOPED_TRACE(length);
+    std::string app(length - fixed.size(), 'v');
+    int32_t rowId = 0;
+    int result = useApp->InsertRow("app_id", ("'" + app + "'").c_str(), &rowId);
+    EXPECT_EQ(result, length < 1025 ? 0 : -1);
+    if (result == 0) {
+      EXPECT_EQ(Query(survey, "SELECT app_id FROM use_app_survey WHERE _id=" +
+                                  std::to_string(rowId)), app);
+    }
+  }
+  sqlite3_close(raw);
+}
+
+// A bus request may only touch its own table, so the statement the daemon keeps for a table
+// must not serve a request of another table's scope.
+TEST_F(BaseLogProviderTest, AKeptInsertServesNoOtherScopesTable) {
+  ASSERT_EQ(useApp->InsertRow("app_id,duration", "'daemon',1"), 0);
+  {
+    DbConnection::BusRequestScope request(survey, "use_app_feature_survey");
+    ASSERT_TRUE(request.Held());
+    int32_t rowId = 0;
+    EXPECT_EQ(useApp->InsertRow("app_id,duration", "'other',2", &rowId), -1);
+    EXPECT_EQ(rowId, -1);
+  }
+  {
+    DbConnection::BusRequestScope request(survey, "use_app_survey");
+    EXPECT_EQ(useApp->InsertRow("app_id,duration", "'own',3"), 0);
+  }
+  {
+    DbConnection::BusRequestScope request(survey, "use_app_feature_survey");
+    EXPECT_EQ(useApp->InsertRow("app_id,duration", "'other',4"), -1) << "nor the request's";
+  }
+  EXPECT_EQ(useApp->InsertRow("app_id,duration", "'daemon',5"), 0);
+  EXPECT_EQ(Query(survey, "SELECT group_concat(app_id) FROM use_app_survey"), "daemon,own,daemon");
+}
+
 // One-step statements are cut by the buffer; lists and appended clauses that would not fit
 // end the process before anything is written past a buffer.
 using BaseLogProviderDeathTest = BaseLogProviderTest;

@@ -13,6 +13,7 @@
 #include "base_log_provider.h"
 #include "db_connection.h"
 #include "provider_registry.h"
+#include "provider_test_env.h"
 #include "storage/db_manager.h"
 
 namespace _CorvaneLogManager {
@@ -88,8 +89,8 @@ class ProviderBusFitTest : public ::testing::Test {
     unsetenv("LOGMGR_SYSROOT");
     (void)system(("rm -rf " + sysroot).c_str());
   }
-  static int OnStatement(unsigned, void* self, void*, void* text) {
-    static_cast<ProviderBusFitTest*>(self)->statements.push_back(static_cast<const char*>(text));
+  static int OnStatement(unsigned, void* self, void* stmt, void*) {
+    static_cast<ProviderBusFitTest*>(self)->statements.push_back(ExpandedText(stmt));
     return 0;
   }
 

@@ -43,15 +43,24 @@ inline bool MatchesWithNumbers(const std::string& text, const std::string& patte
   return t == text.size();
 }
 
+// A started statement's text with its bound values written in as literals: what a kept
+// statement runs reads as the text statement it stands for.
+inline std::string ExpandedText(void* stmt) {
+  char* text = sqlite3_expanded_sql(static_cast<sqlite3_stmt*>(stmt));
+  std::string out = text != nullptr ? text : "";
+  sqlite3_free(text);
+  return out;
+}
+
 // Statements as SQLite starts them, minus the test's own queries.
 struct StatementTrace {
   void Attach(DbConnection* conn) {
     sqlite3_trace_v2(conn->Handle(), SQLITE_TRACE_STMT, &StatementTrace::OnStatement, this);
   }
   std::vector<std::string> Take() { return std::move(statements); }
-  static int OnStatement(unsigned, void* self, void*, void* text) {
+  static int OnStatement(unsigned, void* self, void* stmt, void*) {
     StatementTrace* trace = static_cast<StatementTrace*>(self);
-    if (!trace->paused) trace->statements.push_back(static_cast<const char*>(text));
+    if (!trace->paused) trace->statements.push_back(ExpandedText(stmt));
     return 0;
   }
   std::vector<std::string> statements;

@@ -1,5 +1,10 @@
 #include "reporting/report_builder.h"
 
+#include <pthread.h>
+#include <unistd.h>
+
+#include <atomic>
+
 #include "reporting_test_env.h"
 
 namespace _CorvaneLogManager {
@@ -235,6 +240,81 @@ TEST_F(ReportBuilderTest, ATableWhoseSelectFailsKeepsItsRowsAndTheDayStaysDue) {
   EXPECT_EQ(Bodies("001").size(), 1u);
   EXPECT_EQ(Bodies("002").size(), 1u);
   EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_feature_survey"),
+            std::vector<std::string>{"0"});
+}
+
+// A table's records are queued in one transaction, committed before its rows are purged. A
+// worker stopped inside that transaction (as a stopping daemon ends it) leaves it open with
+// none of the table's records visible and its rows still there; the next run rolls it back and
+// queues every record once: none lost, none twice.
+TEST_F(ReportBuilderTest, AWorkerStoppedInsideATablesRecordsLeavesThemToTheNextRunOnce) {
+  Now(2024, 6, 12, 10);
+  SentDate(2024, 6, 10);
+  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'a.calc',1000");
+  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 13), "'b.mail',20");
+  for (int i = 0; i < 5; ++i) {
+    Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 11, 10 + i),
+        "'pkg" + std::to_string(i) + "',1");
+  }
+  // Holds the worker inside the insert of the queue's fourth record (manage's second) until
+  // the stop has been asked.
+  struct Stopped {
+    ReportBuilder* builder;
+    std::atomic<int> inserts{0};
+    std::atomic<bool> held{false};
+    std::atomic<bool> release{false};
+    std::atomic<bool> returned{false};
+    static void OnChange(void* arg, int op, const char*, const char*, sqlite3_int64) {
+      Stopped* self = static_cast<Stopped*>(arg);
+      if (op != SQLITE_INSERT || ++self->inserts != 4) return;
+      self->held = true;
+      while (!self->release) usleep(200);
+    }
+    static void* Run(void* arg) {
+      Stopped* self = static_cast<Stopped*>(arg);
+      (void)self->builder->RunDaily();
+      self->returned = true;
+      return nullptr;
+    }
+  } stopped{&builder};
+  sqlite3_update_hook(upload->Handle(), &Stopped::OnChange, &stopped);
+  pthread_t worker;
+  ASSERT_EQ(pthread_create(&worker, nullptr, &Stopped::Run, &stopped), 0);
+  for (int i = 0; i < 60000 && !stopped.held; ++i) usleep(500);
+  ASSERT_TRUE(stopped.held) << "the run never reached manage's records";
+  upload->Interrupt();
+  stopped.release = true;
+  ASSERT_EQ(pthread_join(worker, nullptr), 0);
+  sqlite3_update_hook(upload->Handle(), nullptr, nullptr);
+  EXPECT_FALSE(stopped.returned) << "the stop ends the worker";
+
+  EXPECT_TRUE(upload->InTransaction());
+  sqlite3* reader = nullptr;  // what another connection (and a crash) sees: the commits only
+  ASSERT_EQ(sqlite3_open((sysroot + "/opt/usr/dbspace/.ServerUploaderDB.db").c_str(), &reader),
+            SQLITE_OK);
+  sqlite3_stmt* count = nullptr;
+  ASSERT_EQ(sqlite3_prepare_v2(reader, "SELECT group_concat(activity) FROM survey_log", -1,
+                               &count, nullptr),
+            SQLITE_OK);
+  ASSERT_EQ(sqlite3_step(count), SQLITE_ROW);
+  EXPECT_STREQ(reinterpret_cast<const char*>(sqlite3_column_text(count, 0)), "001,001");
+  sqlite3_finalize(count);
+  sqlite3_close(reader);
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_survey"), std::vector<std::string>{"0"});
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"),
+            std::vector<std::string>{"5"});
+  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 10) / 1000);
+
+  ASSERT_EQ(builder.RunDaily(), 0);
+  EXPECT_FALSE(upload->InTransaction());
+  EXPECT_EQ(Bodies("001").size(), 2u);
+  std::vector<std::string> manage = Bodies("003");
+  ASSERT_EQ(manage.size(), 5u);
+  for (int i = 0; i < 5; ++i) {
+    EXPECT_NE(manage[i].find("app_id=pkg" + std::to_string(i) + "¶"), std::string::npos);
+  }
+  EXPECT_EQ(Bodies("007").size(), 1u);
+  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"),
             std::vector<std::string>{"0"});
 }
 

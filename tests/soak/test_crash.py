@@ -9,8 +9,10 @@ closed at the latest timestamp of the collection tables and the store, so a row 
 length appears. After the restart the live files must pass integrity_check again, and the day
 records the restarted daemon hands to the relay keep the duplicate promise of
 docs/RELIABILITY.md: a record is handed over at most as often as the queue held it unmarked at
-the kill, plus once more only if its table still held rows of its day (a day cut short by the
-kill is built again); a record marked as handed over is never handed over again. The last round
+the kill (the copy holds only committed records: a table's records of a day are one
+transaction), plus once more only if its table still held rows of its day (a day cut short by
+the kill is built again; with its records in the queue only when the kill fell between the
+table's commit and its purge); a record marked as handed over is never handed over again. The last round
 lets its run finish, so every run ends with day records handed over.
 """
 import datetime

@@ -507,6 +507,123 @@ TEST_F(DbConnectionTest, ABusRequestTouchesOneTableWithinItsBudgetAndResultLimit
   EXPECT_EQ(rc, -1) << "one column more than a bus request may name";
 }
 
+// A kept statement was judged by the authorizer once, at its prepare: it may serve only the
+// scope (and for a bus request the table) it was judged for, never another.
+TEST_F(DbConnectionTest, KeptStatementsServeOnlyTheScopeTheyWereJudgedFor) {
+  Setup({"CREATE TABLE own(a);", "CREATE TABLE other(b);"});
+  using Value = DbConnection::BoundValue;
+  const Value row[] = {{Value::kText, 0, "v", 1}};
+  const char* intoOther = "INSERT INTO other(b) VALUES (?);";
+  const char* intoOwn = "INSERT INTO own(a) VALUES (?);";
+  EXPECT_EQ(conn.ExecKept(intoOther, row, 1), 0);
+  EXPECT_EQ(conn.ExecKept(intoOther, row, 1), 0);  // the kept one, again
+  {
+    DbConnection::BusRequestScope request(&conn, "own");
+    ASSERT_TRUE(request.Held());
+    EXPECT_EQ(conn.ExecKept(intoOther, row, 1), DbConnection::kNotRun);
+    EXPECT_EQ(conn.ExecKept(intoOwn, row, 1), 0);
+    // Meanwhile another thread's statements stay the daemon's own, kept statement included.
+    struct Daemon {
+      DbConnection* conn;
+      const char* sql;
+      const DbConnection::BoundValue* row;
+      int result = 2;
+      static void* Run(void* arg) {
+        Daemon* self = static_cast<Daemon*>(arg);
+        self->result = self->conn->ExecKept(self->sql, self->row, 1);
+        return nullptr;
+      }
+    } daemon{&conn, intoOther, row};
+    pthread_t thread;
+    ASSERT_EQ(pthread_create(&thread, nullptr, Daemon::Run, &daemon), 0);
+    ASSERT_EQ(pthread_join(thread, nullptr), 0);
+    EXPECT_EQ(daemon.result, 0);
+  }
+  {
+    DbConnection::BusRequestScope request(&conn, "other");
+    EXPECT_EQ(conn.ExecKept(intoOwn, row, 1), DbConnection::kNotRun) << "judged for own only";
+    EXPECT_EQ(conn.Exec("INSERT INTO own(a) VALUES ('v');"), -1) << "as the text is refused";
+  }
+  {
+    DbConnection::SetupScope setup(&conn);
+    EXPECT_EQ(conn.ExecKept(intoOther, row, 1), DbConnection::kNotRun);
+  }
+  EXPECT_EQ(conn.Count("other"), 3);
+  EXPECT_EQ(conn.Count("own"), 1);
+  // A statement that does not prepare, or whose ?s do not match the values, runs nothing.
+  EXPECT_EQ(conn.ExecKept("INSERT INTO gone(a) VALUES (?);", row, 1), DbConnection::kNotRun);
+  EXPECT_EQ(conn.ExecKept("INSERT INTO own(a) VALUES (?, ?);", row, 1), DbConnection::kNotRun);
+  EXPECT_EQ(conn.Count("own"), 1);
+  // Closing finalises the kept statements; the reopened connection prepares afresh.
+  ASSERT_EQ(conn.Close(), 0);
+  ASSERT_EQ(conn.Open(path.c_str()), 0);
+  EXPECT_EQ(conn.ExecKept(intoOther, row, 1), 0);
+  EXPECT_EQ(conn.Count("other"), 4);
+}
+
+// A kept statement answers as Exec does: row id and changes of the calling thread, the
+// failure of a constraint, and a stop that ends its thread inside a transaction, which a
+// later caller rolls back.
+TEST_F(DbConnectionTest, KeptStatementsAnswerAsExecAndAnEndedThreadsTransactionRollsBack) {
+  Setup({"CREATE TABLE t(id INTEGER PRIMARY KEY, x TEXT NOT NULL);"});
+  using Value = DbConnection::BoundValue;
+  const char* sql = "INSERT INTO t(id,x) VALUES (?,?);";
+  const Value first[] = {{Value::kInteger, 41, nullptr, 0}, {Value::kText, 0, "a", 1}};
+  const Value same[] = {{Value::kInteger, 41, nullptr, 0}, {Value::kText, 0, "b", 1}};
+  const Value null[] = {{Value::kInteger, 50, nullptr, 0}, {Value::kNull, 0, nullptr, 0}};
+  ASSERT_EQ(conn.ExecKept(sql, first, 2), 0);
+  EXPECT_EQ(conn.LastInsertRowId(), 41);
+  EXPECT_EQ(conn.Changes(), 1);
+  EXPECT_EQ(conn.ExecKept(sql, same, 2), -1);
+  EXPECT_EQ(conn.ExecKept(sql, null, 2), -1);
+  EXPECT_EQ(Select("SELECT id, x FROM t;", "t"), Rows{"41,a,"});
+
+  ASSERT_EQ(sqlite3_create_function(conn.Handle(), "mark", 0, SQLITE_UTF8, nullptr, Mark, nullptr,
+                                    nullptr),
+            SQLITE_OK);
+  // The worker opens a transaction, inserts, then blocks in an endless statement.
+  struct InTransaction {
+    DbConnection* conn;
+    const Value* row;
+    std::atomic<bool> returned{false};
+    static void* Run(void* arg) {
+      InTransaction* self = static_cast<InTransaction*>(arg);
+      if (self->conn->BeginTransaction() == 0 &&
+          self->conn->ExecKept("INSERT INTO t(id,x) VALUES (?,?);", self->row, 2) == 0) {
+        (void)self->conn->Exec(
+            "WITH RECURSIVE c(x) AS (SELECT mark() UNION ALL SELECT x + 1 FROM c) "
+            "SELECT count(*) FROM c;");
+      }
+      self->returned = true;
+      return nullptr;
+    }
+  };
+  const Value second[] = {{Value::kInteger, 42, nullptr, 0}, {Value::kText, 0, "c", 1}};
+  g_marks = 0;
+  InTransaction worker{&conn, second};
+  pthread_t thread;
+  ASSERT_EQ(pthread_create(&thread, nullptr, InTransaction::Run, &worker), 0);
+  for (int i = 0; i < 20000 && g_marks == 0; ++i) usleep(500);
+  ASSERT_GT(g_marks.load(), 0) << "the worker never entered its statement";
+  conn.Interrupt();
+  ASSERT_EQ(pthread_join(thread, nullptr), 0);
+  EXPECT_FALSE(worker.returned);
+  EXPECT_TRUE(conn.InTransaction()) << "an ended thread cannot close its transaction";
+  EXPECT_EQ(conn.RollBackOpenTransaction(), 0);
+  EXPECT_FALSE(conn.InTransaction());
+  EXPECT_EQ(Select("SELECT id FROM t;", "t"), Rows{"41,"});
+  EXPECT_EQ(conn.RollBackOpenTransaction(), 0) << "none open: nothing to do";
+  // The kept statement the worker held was finalised with it; the next caller prepares anew.
+  EXPECT_EQ(conn.ExecKept(sql, second, 2), 0);
+  EXPECT_EQ(conn.Count("t"), 2);
+  // A failed commit leaves no transaction open either.
+  ASSERT_EQ(conn.BeginTransaction(), 0);
+  EXPECT_EQ(conn.BeginTransaction(), -1) << "no nesting";
+  EXPECT_EQ(conn.CommitTransaction(), 0);
+  EXPECT_EQ(conn.CommitTransaction(), -1);
+  EXPECT_FALSE(conn.InTransaction());
+}
+
 TEST_F(DbConnectionTest, NewFilesAreOwnerOnlyWhateverTheUmask) {
   ASSERT_EQ(conn.Close(), 0);
   mode_t old = umask(0);

@@ -146,11 +146,16 @@ class ReportCycleTest(DeviceTestCase):
         self.assertEqual(self.pref("key_sent_date"), midnight(1))
         self.assertIsNone(proc.poll())
 
+    LONG_DAY = 12000  # rows of each day, each its own record
+
     def long_run(self):
-        """A device whose last day needs thousands of records, with the run under way."""
+        """Three due days of thousands of records each, with the run under way. A table's
+        records become visible at its commit, so the first day's first table shows the run
+        started while two days are still to go."""
         self.prepared_device()
-        self.set_pref("key_sent_date", midnight(2))
-        self.seed_use_app(midnight(1), 4000, apps=4000)
+        self.set_pref("key_sent_date", midnight(4))
+        for days_ago in (3, 2, 1):
+            self.seed_use_app(midnight(days_ago), self.LONG_DAY, apps=self.LONG_DAY)
         proc = self.dev.start_daemon()
         wait_for(lambda: self.dev.query(UPLOAD_DB, "SELECT count(*) FROM survey_log")[0][0] > 20,
                  timeout=30, message="the run to be under way")
@@ -160,15 +165,24 @@ class ReportCycleTest(DeviceTestCase):
         proc = self.long_run()
         proc.send_signal(signal.SIGTERM)
         # Quickly means without finishing the run: a stop that waited for it would have purged
-        # the day and advanced the sent date.
+        # the last day and advanced the sent date to it.
         self.assertEqual(self.dev.wait_exit(proc), 0)
         for db in (SURVEY_DB, UPLOAD_DB, PREF_DB):
             self.assertEqual(self.dev.query(db, "PRAGMA integrity_check"), [("ok",)], db)
-        # The day was not finished: nothing of it was purged and it stays due.
-        self.assertEqual(self.dev.query(SURVEY_DB, "SELECT count(*) FROM use_app_survey"),
-                         [(4000,)])
-        self.assertEqual(self.pref("key_sent_date"), midnight(2))
-        self.assertLess(self.dev.query(UPLOAD_DB, "SELECT count(*) FROM survey_log")[0][0], 4000)
+        self.assertIn(self.pref("key_sent_date"), (midnight(4), midnight(3), midnight(2)))
+        # The last day was not reached: nothing of it was purged.
+        day = self.LONG_DAY
+        self.assertEqual(self.dev.query(SURVEY_DB, "SELECT count(*) FROM use_app_survey "
+                                        "WHERE timestamp >= ?", (midnight(1) * 1000,)), [(day,)])
+        # A day's records are queued whole or not at all, and a day's rows go only once its
+        # records are queued: every row is either still there or a queued record.
+        rows = self.dev.query(SURVEY_DB, "SELECT count(*) FROM use_app_survey")[0][0]
+        queued = self.dev.query(UPLOAD_DB, "SELECT count(*) FROM survey_log "
+                                "WHERE activity='001'")[0][0]
+        self.assertGreater(queued, 0)
+        self.assertLess(queued, 3 * day)
+        self.assertEqual((rows % day, queued % day), (0, 0))
+        self.assertGreaterEqual(rows + queued, 3 * day)
 
     def test_a_caller_busy_on_the_bus_during_a_run_costs_no_record_and_no_repeat(self):
         # Statements of the worker and of bus requests share one connection; a request's checks
@@ -253,7 +267,7 @@ class ReportCycleTest(DeviceTestCase):
         self.dev.set_consent(False)
         self.assertEqual(self.dev.wait_exit(proc, timeout=120), 0)
         self.assertEqual(self.pref("key_sent_date"), midnight(1))
-        self.assertEqual(self.summaries(), [self.day_text(midnight(1))])
+        self.assertEqual(self.summaries(), [self.day_text(midnight(d)) for d in (3, 2, 1)])
 
 
 if __name__ == "__main__":
