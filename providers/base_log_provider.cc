@@ -9,7 +9,7 @@
 #include <atomic>
 
 #include "db_connection.h"
-#include "platform/fixed_path.h"
+#include "providers/local_zone.h"
 #include "providers/statement_buffer.h"
 #include "storage/db_manager.h"
 
@@ -21,8 +21,6 @@ namespace {
 // table's own check interval says.
 constexpr int kTrimBatch = 500;
 constexpr long long kMsPerDay = 86400000LL;
-// Length of "/usr/share/zoneinfo/", skipped (not compared) in front of the zone name.
-constexpr size_t kZoneinfoPrefix = 20;
 
 long long NowMs() {
   struct timeval tv;
@@ -171,16 +169,11 @@ void BaseLogProvider::AppendAutoColumns(std::string* columns, std::string* value
       columns->append(",timestamp");
       AppendCommaAndNumber(values, NowMs());
     } else if (column == "time_zone") {
-      char pathBuf[4096];
-      const char* link = logmgr_fixed_path("/opt/etc/localtime", pathBuf, sizeof(pathBuf));
-      char target[1024];
-      ssize_t len = readlink(link, target, sizeof(target) - 1);
-      if (len <= static_cast<ssize_t>(kZoneinfoPrefix)) continue;  // unreadable or no zone
-      target[len] = '\0';
+      std::string zone;
+      if (!LocalZoneLiteral(&zone)) continue;  // unreadable or no zone
       columns->append(",time_zone");
-      values->append(",'");
-      values->append(target + kZoneinfoPrefix);
-      values->append("'");
+      values->push_back(',');
+      values->append(zone);
     }
   }
 }

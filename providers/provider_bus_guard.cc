@@ -10,15 +10,12 @@
 #include <sys/time.h>
 #include <unistd.h>
 
-#include "platform/fixed_path.h"
+#include "providers/local_zone.h"
 #include "providers/statement_buffer.h"
 
 namespace _CorvaneLogManager {
 
 namespace {
-
-// Length of "/usr/share/zoneinfo/" in front of the zone name of the localtime link.
-constexpr size_t kZoneinfoPrefix = 20;
 
 bool IsAutoColumn(const char* name) {
   return strcmp(name, "timestamp") == 0 || strcmp(name, "time_zone") == 0;
@@ -115,14 +112,10 @@ BusRowLists AutoColumnTexts(const std::vector<std::string>& declared) {
       texts.columns.append(",timestamp");
       texts.values.append(now);
     } else if (column == "time_zone") {
-      char pathBuf[4096];
-      const char* link = logmgr_fixed_path("/opt/etc/localtime", pathBuf, sizeof(pathBuf));
-      char target[1024];
-      ssize_t len = readlink(link, target, sizeof(target) - 1);
-      if (len <= static_cast<ssize_t>(kZoneinfoPrefix)) continue;
-      target[len] = '\0';
+      std::string zone;
+      if (!LocalZoneLiteral(&zone)) continue;
       texts.columns.append(",time_zone");
-      texts.values.append(",'").append(target + kZoneinfoPrefix).append("'");
+      texts.values.append(",").append(zone);
     }
   }
   return texts;

@@ -27,7 +27,9 @@ TEST_F(BaseLogProviderTest, InsertAppendsTimestampAndZoneOrLeavesZoneNull) {
   } cases[] = {{"/usr/share/zoneinfo/Europe/Berlin", "Europe/Berlin"},
                {"/usr/share/zoneinfo/X", "X"},  // 21 characters: one left after the prefix
                {"/usr/share/zoneinfo/", nullptr},
-               {"", nullptr}};
+               {"", nullptr},
+               {"/usr/share/zoneinfo/O'Hare", "O'Hare"},  // stored as it stands
+               {"/usr/share/zoneinfo/Europe/Berlin", "Europe/Berlin"}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.link);
     SetLocaltimeLink(c.link);
@@ -37,7 +39,10 @@ TEST_F(BaseLogProviderTest, InsertAppendsTimestampAndZoneOrLeavesZoneNull) {
     long long after = TestNowMs();
     std::vector<std::string> run = Taken("INSERT");
     ASSERT_EQ(run.size(), 1u);
-    std::string zone = c.zone ? std::string(",'") + c.zone + "'" : "";
+    std::string zone;
+    for (const char* z = c.zone; z != nullptr && *z != '\0'; ++z)
+      zone += *z == '\'' ? std::string("''") : std::string(1, *z);
+    if (c.zone) zone = ",'" + zone + "'";
     std::vector<long long> stamp;
     ASSERT_TRUE(MatchesWithNumbers(run[0],
                                    std::string("INSERT INTO use_app_survey(app_id,duration,"
