@@ -6,6 +6,7 @@ tests drive it with vconftool, devsim, logmgrctl, D-Bus and files.
 """
 import json
 import os
+import re
 import shutil
 import signal
 import sqlite3
@@ -80,12 +81,25 @@ def valgrind_prefix(log_dir):
             f"--log-file={os.path.join(log_dir, 'valgrind.%p.log')}"]
 
 
+# Valgrind 3.19 (Debian 12) does not know pidfd_open; the call fails there with ENOSYS, which the
+# daemon handles by looking the process up again, so the notice (five lines) is no error of ours.
+UNKNOWN_SYSCALL = re.compile(r"^--\d+-- WARNING: unhandled amd64-linux syscall: 434$")
+
+
 def valgrind_reports(log_dir):
     reports = []
     for name in sorted(os.listdir(log_dir)):
         if name.startswith("valgrind.") and name.endswith(".log"):
             with open(os.path.join(log_dir, name)) as f:
-                text = f.read().strip()
+                lines, kept, skip = f.read().splitlines(), [], 0
+            for line in lines:
+                if UNKNOWN_SYSCALL.match(line):
+                    skip = 5
+                if skip:
+                    skip -= 1
+                else:
+                    kept.append(line)
+            text = "\n".join(kept).strip()
             if text:
                 reports.append(text)
     return reports
