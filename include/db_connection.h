@@ -147,6 +147,9 @@ class DbConnection {
   // already pending (sqlite3_interrupt alone would lose it).
   void BeginStatement();
   [[noreturn]] void EndInterruptedThread();
+  // Steps |stmt| to its end and records its changes and row id as the calling thread's last
+  // Exec; returns the last step's code.
+  int StepToEnd(sqlite3_stmt* stmt);
   // First column of the last row of |sql|; 0 on failure.
   int64_t ScalarQuery(const char* sql);
   // Statement start shared by the queries: begins the statement and prepares |sql|. An

@@ -282,11 +282,7 @@ int DbConnection::Open(const char* path) {
   return 0;
 }
 
-int DbConnection::Exec(const char* sql) {
-  if (sql == nullptr || db == nullptr) return -1;
-  sqlite3_stmt* stmt = nullptr;
-  // Deliberately left non-cancellable after a failed statement, a refused text included.
-  if (!PrepareOrFail(sql, &stmt, false)) return -1;
+int DbConnection::StepToEnd(sqlite3_stmt* stmt) {
   int rc;
   // The report worker and the main loop share the connection: the counts a caller reads
   // after its statement are taken under the connection's mutex, before the other thread's
@@ -297,6 +293,15 @@ int DbConnection::Exec(const char* sql) {
   }
   t_lastExec = {this, sqlite3_changes(db), sqlite3_last_insert_rowid(db)};
   sqlite3_mutex_leave(mutex);
+  return rc;
+}
+
+int DbConnection::Exec(const char* sql) {
+  if (sql == nullptr || db == nullptr) return -1;
+  sqlite3_stmt* stmt = nullptr;
+  // Deliberately left non-cancellable after a failed statement, a refused text included.
+  if (!PrepareOrFail(sql, &stmt, false)) return -1;
+  int rc = StepToEnd(stmt);
   if (rc == SQLITE_INTERRUPT) {
     EndThreadUnlessBudgetSpent(stmt);
     return -1;
@@ -674,14 +679,7 @@ int DbConnection::ExecKept(const char* sql, const BoundValue* values, int count)
       return kNotRun;
     }
   }
-  int rc;
-  // As in Exec: the counts are taken under the connection's mutex.
-  sqlite3_mutex* mutex = sqlite3_db_mutex(db);
-  sqlite3_mutex_enter(mutex);
-  while ((rc = sqlite3_step(stmt)) == SQLITE_ROW) {
-  }
-  t_lastExec = {this, sqlite3_changes(db), sqlite3_last_insert_rowid(db)};
-  sqlite3_mutex_leave(mutex);
+  int rc = StepToEnd(stmt);
   if (rc == SQLITE_INTERRUPT) {
     EndThreadUnlessBudgetSpent(stmt);
     return -1;
