@@ -62,8 +62,7 @@ void Activate() {
 }
 
 double Since(std::chrono::steady_clock::time_point start) {
-  return std::chrono::duration<double, std::nano>(std::chrono::steady_clock::now() - start)
-      .count();
+  return std::chrono::duration<double, std::nano>(std::chrono::steady_clock::now() - start).count();
 }
 
 // Arguments: installed apps; index (1) or not (0); whether the database changed (its time

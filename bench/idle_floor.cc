@@ -17,7 +17,7 @@
 #include <string>
 #include <vector>
 
-#include "main_loop_glib.h"
+#include "platform/main_loop_glib.h"
 
 namespace {
 
@@ -45,8 +45,7 @@ int Names(void* names, int columns, char** values, char**) {
 // Opens |path| as the daemon does (WAL, synchronous NORMAL) and reads each table once.
 sqlite3* OpenAndRead(const char* path) {
   sqlite3* db = nullptr;
-  if (sqlite3_open_v2(path, &db, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr) !=
-      SQLITE_OK)
+  if (sqlite3_open_v2(path, &db, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr) != SQLITE_OK)
     return nullptr;
   std::vector<std::string> tables;
   int rows = 0;

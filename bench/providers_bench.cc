@@ -13,10 +13,10 @@
 #include <map>
 #include <string>
 
-#include "base_log_provider.h"
 #include "bench/ratio_reporter.h"
-#include "db_connection.h"
-#include "provider_registry.h"
+#include "include/base_log_provider.h"
+#include "include/db_connection.h"
+#include "include/provider_registry.h"
 #include "storage/db_manager.h"
 
 using namespace _CorvaneLogManager;
@@ -239,10 +239,11 @@ int main(int argc, char** argv) {
     const Interleaved& t = g_interleaved[i];
     if (t.bareCpu <= 0 || t.bareWall <= 0) continue;
     const char* where = i == 0 ? "empty table" : "at 5,000 rows";
-    printf("interleaved, %-13s InsertRow %.1f us cpu / %.1f us wall, bare %.1f / %.1f: "
-           "cpu %.2f, wall %.2f\n",
-           where, t.insertCpu, t.insertWall, t.bareCpu, t.bareWall, t.insertCpu / t.bareCpu,
-           t.insertWall / t.bareWall);
+    printf(
+        "interleaved, %-13s InsertRow %.1f us cpu / %.1f us wall, bare %.1f / %.1f: "
+        "cpu %.2f, wall %.2f\n",
+        where, t.insertCpu, t.insertWall, t.bareCpu, t.bareWall, t.insertCpu / t.bareCpu,
+        t.insertWall / t.bareWall);
   }
   benchmark::Shutdown();
   return 0;

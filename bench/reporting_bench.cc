@@ -15,14 +15,13 @@
 #include <vector>
 
 #include "bench/ratio_reporter.h"
-#include "db_connection.h"
-#include "log_manager.h"
-#include "provider_registry.h"
+#include "include/db_connection.h"
+#include "include/log_manager.h"
+#include "include/provider_registry.h"
 #include "reporting/report_builder.h"
 #include "reporting/uploader.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
-
 
 namespace _CorvaneLogManager {
 namespace {
@@ -95,15 +94,18 @@ class Device {
       (void)survey->Exec(sql);
       snprintf(sql, sizeof(sql),
                "INSERT INTO manage_app_survey(timestamp,installed_app_id,type) "
-               "VALUES (%lld,'app.%d',%d);", stamp, i % 40, i % 3);
+               "VALUES (%lld,'app.%d',%d);",
+               stamp, i % 40, i % 3);
       (void)survey->Exec(sql);
       snprintf(sql, sizeof(sql),
                "INSERT INTO report_app_error_survey(timestamp,app_id,type) "
-               "VALUES (%lld,'app.%d',%d);", stamp, i % 40, i % 2);
+               "VALUES (%lld,'app.%d',%d);",
+               stamp, i % 40, i % 2);
       (void)survey->Exec(sql);
       snprintf(sql, sizeof(sql),
                "INSERT INTO use_app_feature_survey(timestamp,app_id,feature,extra,value) "
-               "VALUES (%lld,'lm','F%03d','',%d);", stamp, i % 10, i);
+               "VALUES (%lld,'lm','F%03d','',%d);",
+               stamp, i % 10, i);
       (void)survey->Exec(sql);
     }
     (void)survey->Exec("COMMIT;");
@@ -219,23 +221,30 @@ class Floor {
     int windows;
     long long length;
   };
-#define CLAMPED(col)                                                                   \
-  "CASE WHEN COUNT(" col ")=0 THEN NULL WHEN MAX(typeof(" col ") NOT IN ('integer','null')) " \
+#define CLAMPED(col)                                          \
+  "CASE WHEN COUNT(" col ")=0 THEN NULL WHEN MAX(typeof(" col \
+  ") NOT IN ('integer','null')) "                             \
   "THEN TOTAL(" col ") ELSE CAST(TOTAL(" col ") AS INTEGER) END"
   static constexpr Table kTables[] = {
       {"001", "use_app_survey",
-       "SELECT timestamp,app_id,duration , COUNT(1), " CLAMPED("duration") " FROM use_app_survey "
-       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id;", 8, 3 * 3600000LL},
+       "SELECT timestamp,app_id,duration , COUNT(1), " CLAMPED(
+           "duration") " FROM use_app_survey "
+                       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id;",
+       8, 3 * 3600000LL},
       {"003", "manage_app_survey",
        "SELECT timestamp,installed_app_id,type FROM manage_app_survey "
-       "WHERE timestamp >= ?1 and timestamp < ?2;", 1, 86399000LL},
+       "WHERE timestamp >= ?1 and timestamp < ?2;",
+       1, 86399000LL},
       {"004", "report_app_error_survey",
        "SELECT timestamp,app_id,type , COUNT(1) FROM report_app_error_survey "
-       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id,type;", 1, 86400000LL},
+       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id,type;",
+       1, 86400000LL},
       {"002", "use_app_feature_survey",
-       "SELECT timestamp,app_id,feature,extra,value , COUNT(1), " CLAMPED("value") " FROM "
-       "use_app_feature_survey WHERE timestamp >= ?1 and timestamp < ?2 "
-       "GROUP BY app_id,feature,extra;", 8, 3 * 3600000LL},
+       "SELECT timestamp,app_id,feature,extra,value , COUNT(1), " CLAMPED(
+           "value") " FROM "
+                    "use_app_feature_survey WHERE timestamp >= ?1 and timestamp < ?2 "
+                    "GROUP BY app_id,feature,extra;",
+       8, 3 * 3600000LL},
   };
 #undef CLAMPED
 
@@ -287,8 +296,8 @@ void BM_DailyRunAgainstFloor(benchmark::State& state) {
     state.ResumeTiming();
   }
   double n = static_cast<double>(state.iterations());
-  g_costs = {sum.runCpu / n,         sum.runWall / n,        sum.floorCpu / n,
-             sum.floorWall / n,      runBytes / kMiB / n,    floorBytes / kMiB / n};
+  g_costs = {sum.runCpu / n,    sum.runWall / n,     sum.floorCpu / n,
+             sum.floorWall / n, runBytes / kMiB / n, floorBytes / kMiB / n};
   state.counters["run_cpu_ms"] = g_costs.runCpu;
   state.counters["floor_cpu_ms"] = g_costs.floorCpu;
   state.counters["run_MiB"] = g_costs.runMiB;
@@ -309,14 +318,18 @@ void BM_BareGroupByQueries(benchmark::State& state) {
     long long length;
   } queries[] = {
       {"SELECT timestamp,app_id,duration , COUNT(1), SUM(duration) FROM use_app_survey "
-       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id;", 8, 3 * 3600000LL},
+       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id;",
+       8, 3 * 3600000LL},
       {"SELECT timestamp,installed_app_id,type FROM manage_app_survey "
-       "WHERE timestamp >= ?1 and timestamp < ?2;", 1, 86399000LL},
+       "WHERE timestamp >= ?1 and timestamp < ?2;",
+       1, 86399000LL},
       {"SELECT timestamp,app_id,type , COUNT(1) FROM report_app_error_survey "
-       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id,type;", 1, 86400000LL},
+       "WHERE timestamp >= ?1 and timestamp < ?2 GROUP BY app_id,type;",
+       1, 86400000LL},
       {"SELECT timestamp,app_id,feature,extra,value , COUNT(1), SUM(value) FROM "
        "use_app_feature_survey WHERE timestamp >= ?1 and timestamp < ?2 "
-       "GROUP BY app_id,feature,extra;", 8, 3 * 3600000LL},
+       "GROUP BY app_id,feature,extra;",
+       8, 3 * 3600000LL},
   };
   long long cells = 0;
   for (auto _ : state) {
@@ -388,7 +401,8 @@ int main(int argc, char** argv) {
            c.runWall / c.floorWall);
   }
   double bare = RatioReporter::Find(reporter.cpu, "BM_BareGroupByQueries");
-  if (bare > 0 && c.runCpu > 0) printf("daily run / bare selects only: cpu %.2f\n", c.runCpu / bare);
+  if (bare > 0 && c.runCpu > 0)
+    printf("daily run / bare selects only: cpu %.2f\n", c.runCpu / bare);
   benchmark::Shutdown();
   return 0;
 }

@@ -15,7 +15,7 @@
 #include <vector>
 
 #include "bench/ratio_reporter.h"
-#include "db_connection.h"
+#include "include/db_connection.h"
 
 using namespace _CorvaneLogManager;
 

@@ -13,9 +13,9 @@
 #include <sys/time.h>
 #include <unistd.h>
 
-#include "base_log_provider.h"
 #include "collectors/row_values.h"
-#include "provider_registry.h"
+#include "include/base_log_provider.h"
+#include "include/provider_registry.h"
 
 namespace _CorvaneLogManager {
 

@@ -7,10 +7,10 @@
 #include <stdio.h>
 #include <string.h>
 
-#include "base_log_provider.h"
 #include "collectors/row_values.h"
 #include "collectors/trusted_sender.h"
-#include "provider_registry.h"
+#include "include/base_log_provider.h"
+#include "include/provider_registry.h"
 
 namespace _CorvaneLogManager {
 

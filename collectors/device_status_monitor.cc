@@ -12,13 +12,13 @@
 
 #include <string>
 
-#include "base_log_provider.h"
 #include "collectors/app_usage_monitor.h"
 #include "collectors/row_values.h"
 #include "collectors/trusted_sender.h"
-#include "db_connection.h"
-#include "log_manager.h"
-#include "provider_registry.h"
+#include "include/base_log_provider.h"
+#include "include/db_connection.h"
+#include "include/log_manager.h"
+#include "include/provider_registry.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
 #include "storage/status_snapshot_store.h"

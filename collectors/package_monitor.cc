@@ -4,9 +4,9 @@
 #include <stdio.h>
 #include <string.h>
 
-#include "base_log_provider.h"
 #include "collectors/row_values.h"
-#include "provider_registry.h"
+#include "include/base_log_provider.h"
+#include "include/provider_registry.h"
 
 namespace _CorvaneLogManager {
 

@@ -3,7 +3,7 @@
 #include <stdio.h>
 #include <string.h>
 
-#include "sql_literal.h"
+#include "include/sql_literal.h"
 
 namespace _CorvaneLogManager {
 

@@ -1,4 +1,4 @@
-#include "daemon_lifecycle.h"
+#include "include/daemon_lifecycle.h"
 
 #include <Ecore.h>
 #include <dbus/dbus-glib-lowlevel.h>
@@ -10,8 +10,8 @@
 #include <vconf.h>
 
 #include "collectors/trusted_sender.h"
-#include "log_manager.h"
-#include "main_loop_glib.h"
+#include "include/log_manager.h"
+#include "platform/main_loop_glib.h"
 #include "reporting/report_scheduler.h"
 
 namespace _CorvaneLogManager {

@@ -1,4 +1,4 @@
-#include "log_manager.h"
+#include "include/log_manager.h"
 
 #include <sys/time.h>
 
@@ -8,7 +8,7 @@
 #include "collectors/crash_monitor.h"
 #include "collectors/device_status_monitor.h"
 #include "collectors/package_monitor.h"
-#include "provider_registry.h"
+#include "include/provider_registry.h"
 #include "reporting/report_scheduler.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"

@@ -1,6 +1,6 @@
 #include <sqlite3.h>
 
-#include "daemon_lifecycle.h"
+#include "include/daemon_lifecycle.h"
 
 int main() {
   // Before any SQLite use: with no preallocated page cache each connection allocates its pages

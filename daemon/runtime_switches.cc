@@ -1,6 +1,6 @@
 #include <vconf.h>
 
-#include "log_manager.h"
+#include "include/log_manager.h"
 
 namespace _CorvaneLogManager {
 

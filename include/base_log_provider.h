@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "db_connection.h"
+#include "include/db_connection.h"
 
 namespace _CorvaneLogManager {
 

@@ -195,6 +195,23 @@ class DbConnection {
 bool GetDbEncryption();
 void SetDbEncryption(bool on);
 
+// The rows a Select (or a provider's SelectRows) hands out, owned here and freed together when
+// this goes, also when a stopped worker unwinds through it (memory only, no statement). Pass
+// &count and &rows as the select's out-parameters on an empty one.
+struct QueryRows {
+  QueryRows() = default;
+  ~QueryRows() { Reset(); }
+  QueryRows(const QueryRows&) = delete;
+  QueryRows& operator=(const QueryRows&) = delete;
+
+  const char* operator[](int i) const { return rows[i]; }
+  // Frees what is held and leaves the rows empty, ready for another select.
+  void Reset();
+
+  char** rows = nullptr;
+  int count = 0;
+};
+
 }  // namespace _CorvaneLogManager
 
 #endif  // LOGMGR_INCLUDE_DB_CONNECTION_H_

@@ -1,4 +1,4 @@
-#include "base_log_provider.h"
+#include "include/base_log_provider.h"
 
 #include <stdio.h>
 #include <string.h>
@@ -8,7 +8,7 @@
 
 #include <atomic>
 
-#include "db_connection.h"
+#include "include/db_connection.h"
 #include "providers/local_zone.h"
 #include "providers/statement_buffer.h"
 #include "storage/db_manager.h"
@@ -84,8 +84,7 @@ int ParsePlainLiterals(const char* text, DbConnection::BoundValue* out, int room
         decoded[used++] = '\'';
         p = quote + 2;
       }
-      value = {DbConnection::BoundValue::kText, 0, decoded + start,
-               static_cast<int>(used - start)};
+      value = {DbConnection::BoundValue::kText, 0, decoded + start, static_cast<int>(used - start)};
     } else if ((*p >= '0' && *p <= '9') || (*p == '-' && p[1] >= '0' && p[1] <= '9')) {
       // An integer of at most 18 digits: what SQLite reads from it is exactly this value, never
       // a real. "-" right before the digits negates it, as the statement's unary minus would.

@@ -1,4 +1,4 @@
-#include "provider_registry.h"
+#include "include/provider_registry.h"
 
 #include <new>
 

@@ -2,7 +2,7 @@
 
 #include <stdio.h>
 
-#include "db_connection.h"
+#include "include/db_connection.h"
 #include "providers/statement_buffer.h"
 #include "storage/db_manager.h"
 

@@ -6,7 +6,7 @@
 
 #include <stdint.h>
 
-#include "base_log_provider.h"
+#include "include/base_log_provider.h"
 
 namespace _CorvaneLogManager {
 

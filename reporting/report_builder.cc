@@ -8,13 +8,13 @@
 
 #include <initializer_list>
 
-#include "base_log_provider.h"
-#include "db_connection.h"
-#include "log_manager.h"
-#include "provider_registry.h"
-#include "reporting/local_midnight.h"
+#include "base/clock.h"
+#include "include/base_log_provider.h"
+#include "include/db_connection.h"
+#include "include/log_manager.h"
+#include "include/provider_registry.h"
+#include "include/sql_literal.h"
 #include "reporting/row_splitter.h"
-#include "sql_literal.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
 
@@ -262,10 +262,10 @@ int ReportBuilder::AggregateWindows(const Aggregation& agg, time_t day) {
     BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(agg.table);
     if (provider == nullptr) return -1;
     SelectedRows selected;
-    int rc = agg.grouped ? provider->SelectGroupedRows(columns, where, nullptr, group,
-                                                       &selected.count, &selected.rows)
-                         : provider->SelectRows(columns, where, nullptr, &selected.count,
-                                                &selected.rows);
+    int rc = agg.grouped
+                 ? provider->SelectGroupedRows(columns, where, nullptr, group, &selected.count,
+                                               &selected.rows)
+                 : provider->SelectRows(columns, where, nullptr, &selected.count, &selected.rows);
     if (rc != 0) return -1;
     int result = 0;
     for (int i = 0; i < selected.count && result == 0 && selected.rows != nullptr; ++i) {
@@ -296,8 +296,8 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
   char body[kBodySize];
   size_t len = BeginBody(body, sizeof(body), date);
   if (agg.grouped) {
-    AppendTexts(body, sizeof(body), &len, {"sum=", sumText, kSeparator, "count=",
-                                           fields[1 + keyCount]});
+    AppendTexts(body, sizeof(body), &len,
+                {"sum=", sumText, kSeparator, "count=", fields[1 + keyCount]});
   }
   for (int k = 0; k < keyCount; ++k) {
     const char* value = (hasSum && k == keyCount - 1) ? fields[fieldCount - 1] : fields[1 + k];
@@ -313,10 +313,11 @@ void ReportBuilder::PrepareHead() {
   char head[kBodySize];
   size_t len = 0;
   head[0] = '\0';
-  AppendF(head, sizeof(head), &len, "mcc=%s%smnc=%s%sdid=%smodel=%s%sfw_ver=%s%sdate=",
-          DeviceText(identity.Mcc()).c_str(), kSeparator, DeviceText(identity.Mnc()).c_str(),
-          kSeparator, kSeparator, DeviceText(identity.Model()).c_str(), kSeparator,
-          DeviceText(AppVersion()).c_str(), kSeparator);
+  AppendF(head, sizeof(head), &len,
+          "mcc=%s%smnc=%s%sdid=%smodel=%s%sfw_ver=%s%sdate=", DeviceText(identity.Mcc()).c_str(),
+          kSeparator, DeviceText(identity.Mnc()).c_str(), kSeparator, kSeparator,
+          DeviceText(identity.Model()).c_str(), kSeparator, DeviceText(AppVersion()).c_str(),
+          kSeparator);
   bodyHead = head;
   recordVersion = DeviceText(AppVersion());
   headReady = true;

@@ -11,12 +11,12 @@
 
 #include <new>
 
-#include "base_log_provider.h"
-#include "daemon_lifecycle.h"
-#include "db_connection.h"
-#include "log_manager.h"
-#include "provider_registry.h"
-#include "reporting/local_midnight.h"
+#include "base/clock.h"
+#include "include/base_log_provider.h"
+#include "include/daemon_lifecycle.h"
+#include "include/db_connection.h"
+#include "include/log_manager.h"
+#include "include/provider_registry.h"
 #include "reporting/report_builder.h"
 #include "reporting/row_splitter.h"
 #include "reporting/uploader.h"

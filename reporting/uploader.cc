@@ -6,7 +6,7 @@
 
 #include <new>
 
-#include "log_manager.h"
+#include "include/log_manager.h"
 #include "providers/server_upload_log_provider.h"
 #include "reporting/row_splitter.h"
 

@@ -1,4 +1,4 @@
-#include "db_connection.h"
+#include "include/db_connection.h"
 
 #include <dlfcn.h>
 #include <errno.h>
@@ -705,6 +705,14 @@ int DbConnection::RollBackOpenTransaction() {
   return Exec("ROLLBACK;");
 }
 
-bool DbConnection::InTransaction() const { return db != nullptr && sqlite3_get_autocommit(db) == 0; }
+bool DbConnection::InTransaction() const {
+  return db != nullptr && sqlite3_get_autocommit(db) == 0;
+}
+
+void QueryRows::Reset() {
+  if (rows != nullptr) FreeRows(rows, count);
+  rows = nullptr;
+  count = 0;
+}
 
 }  // namespace _CorvaneLogManager

@@ -5,8 +5,8 @@
 #include <algorithm>
 #include <new>
 
-#include "base_log_provider.h"
-#include "db_connection.h"
+#include "include/base_log_provider.h"
+#include "include/db_connection.h"
 #include "platform/fixed_path.h"
 
 namespace _CorvaneLogManager {

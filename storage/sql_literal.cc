@@ -1,4 +1,4 @@
-#include "sql_literal.h"
+#include "include/sql_literal.h"
 
 #include <string.h>
 

@@ -7,9 +7,9 @@
 
 #include <new>
 
-#include "db_connection.h"
+#include "include/db_connection.h"
+#include "include/sql_literal.h"
 #include "platform/fixed_path.h"
-#include "sql_literal.h"
 
 namespace _CorvaneLogManager {
 

@@ -1,11 +1,11 @@
 // vconftool: set, get and unset vconf keys of the (simulated) device.
 #include <stdio.h>
 #include <string.h>
+#include <vconf.h>
 
 #include <string>
 
-#include "vconf.h"
-#include "vconf_store.h"
+#include "platform/host/vconf_store.h"
 
 namespace {
 
@@ -68,9 +68,15 @@ int Get(int argc, char** argv) {
   if (rc == VCONF_ERROR_FILE_NO_ENT) return Fail("no such key '%s'", argv[2]);
   if (rc != VCONF_OK) return Fail("cannot read key '%s'", argv[2]);
   switch (v.type) {
-    case VCONF_TYPE_DOUBLE: printf("%.17g\n", v.d); break;
-    case VCONF_TYPE_STRING: printf("%s\n", v.s.c_str()); break;
-    default: printf("%d\n", v.i); break;
+    case VCONF_TYPE_DOUBLE:
+      printf("%.17g\n", v.d);
+      break;
+    case VCONF_TYPE_STRING:
+      printf("%s\n", v.s.c_str());
+      break;
+    default:
+      printf("%d\n", v.i);
+      break;
   }
   return 0;
 }

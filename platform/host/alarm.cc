@@ -1,8 +1,7 @@
 // Alarms live in the process: each registered alarm is one GLib timeout aimed at its next
 // wall-clock time. A repeating alarm re-aims after every expiry, skipping the times a wall-clock
 // jump has already passed, so it never fires in a burst.
-#include "alarm.h"
-
+#include <alarm.h>
 #include <glib.h>
 #include <string.h>
 #include <sys/time.h>

@@ -4,7 +4,7 @@
 // rollback journal or its WAL log. Any such event drops the answers and the connection (an open
 // connection would go on reading a replaced file's old inode); the next lookup reopens. Without
 // a watch (no directory yet) every lookup opens and closes the file, as it must then.
-#include "app_db.h"
+#include "platform/host/app_db.h"
 
 #include <errno.h>
 #include <sqlite3.h>
@@ -15,7 +15,7 @@
 #include <mutex>
 #include <unordered_map>
 
-#include "fixed_path.h"
+#include "platform/fixed_path.h"
 
 namespace logmgr_host {
 

@@ -2,8 +2,7 @@
 // connection, attached to the GLib default main context, and count only from a trusted sender;
 // a process's application is the one whose executable is the process's /proc/<pid>/exe, seen
 // from inside the sysroot.
-#include "aul.h"
-
+#include <aul.h>
 #include <dbus/dbus-glib-lowlevel.h>
 #include <dbus/dbus.h>
 #include <limits.h>
@@ -14,8 +13,8 @@
 
 #include <string>
 
-#include "app_db.h"
-#include "sender_trust.h"
+#include "platform/host/app_db.h"
+#include "platform/host/sender_trust.h"
 
 namespace {
 

@@ -10,7 +10,7 @@
 #include <sstream>
 #include <string>
 
-#include "fixed_path.h"
+#include "platform/fixed_path.h"
 
 namespace {
 

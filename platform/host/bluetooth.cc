@@ -1,8 +1,7 @@
 // Host Bluetooth bonding over BlueZ on the system bus. A device object's Paired turning true is
 // a bond created, turning false or the object's removal a bond destroyed. Callbacks run on the
 // GLib default main context, where the signal subscriptions are made.
-#include "bluetooth.h"
-
+#include <bluetooth.h>
 #include <gio/gio.h>
 #include <stdint.h>
 

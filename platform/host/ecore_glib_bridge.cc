@@ -8,7 +8,7 @@
 
 #include <vector>
 
-#include "main_loop_glib.h"
+#include "platform/main_loop_glib.h"
 
 namespace {
 
@@ -22,7 +22,8 @@ int GlibSelect(int nfds, fd_set* rfds, fd_set* wfds, fd_set* efds, struct timeva
   gint glib_timeout = -1;
   gint n = 0;
   while ((n = g_main_context_query(ctx, max_priority, &glib_timeout, fds.data(),
-                                   static_cast<gint>(fds.size()))) > static_cast<gint>(fds.size())) {
+                                   static_cast<gint>(fds.size()))) >
+         static_cast<gint>(fds.size())) {
     fds.resize(static_cast<size_t>(n));
   }
 

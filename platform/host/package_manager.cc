@@ -4,6 +4,7 @@
 #include <dbus/dbus-glib-lowlevel.h>
 #include <dbus/dbus.h>
 #include <limits.h>
+#include <package-manager.h>
 #include <string.h>
 
 #include <deque>
@@ -12,8 +13,7 @@
 #include <string>
 #include <vector>
 
-#include "package-manager.h"
-#include "sender_trust.h"
+#include "platform/host/sender_trust.h"
 
 namespace {
 

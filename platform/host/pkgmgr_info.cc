@@ -1,5 +1,6 @@
 // Host pkgmgr-info over the app database. Handles are heap records owned by the caller until
 // their destroy call; the ones passed to a foreach callback live only for that call.
+#include <pkgmgr-info.h>
 #include <string.h>
 
 #include <new>
@@ -7,8 +8,7 @@
 #include <utility>
 #include <vector>
 
-#include "app_db.h"
-#include "pkgmgr-info.h"
+#include "platform/host/app_db.h"
 
 using logmgr_host::AppColumn;
 using logmgr_host::AppRecord;

@@ -1,4 +1,4 @@
-#include "sender_trust.h"
+#include "platform/host/sender_trust.h"
 
 #include <string.h>
 

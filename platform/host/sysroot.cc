@@ -2,7 +2,7 @@
 #include <stdlib.h>
 #include <string.h>
 
-#include "fixed_path.h"
+#include "platform/fixed_path.h"
 
 const char* logmgr_fixed_path(const char* path, char* buf, size_t size) {
   const char* root = getenv("LOGMGR_SYSROOT");

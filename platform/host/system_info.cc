@@ -1,14 +1,13 @@
 // Host capi-system-info over the sysroot's files: the device tree or DMI for the model and
 // os-release for the build string.
-#include "system_info.h"
-
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <system_info.h>
 
 #include <string>
 
-#include "fixed_path.h"
+#include "platform/fixed_path.h"
 
 namespace {
 

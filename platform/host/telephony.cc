@@ -1,10 +1,9 @@
 // Host capi-telephony over oFono on the system bus: one handle per modem, the operator text
 // from the modem's SimManager (MobileCountryCode followed by MobileNetworkCode).
-#include "telephony.h"
-
 #include <dbus/dbus.h>
 #include <stdlib.h>
 #include <string.h>
+#include <telephony.h>
 
 #include <new>
 #include <string>
@@ -35,7 +34,8 @@ std::vector<std::string> ModemPaths(DBusConnection* bus) {
   DBusMessage* reply = Call(bus, "/", "org.ofono.Manager", "GetModems");
   if (reply == nullptr) return paths;
   DBusMessageIter it, array;
-  if (dbus_message_iter_init(reply, &it) && dbus_message_iter_get_arg_type(&it) == DBUS_TYPE_ARRAY) {
+  if (dbus_message_iter_init(reply, &it) &&
+      dbus_message_iter_get_arg_type(&it) == DBUS_TYPE_ARRAY) {
     dbus_message_iter_recurse(&it, &array);
     while (dbus_message_iter_get_arg_type(&array) == DBUS_TYPE_STRUCT) {
       DBusMessageIter entry;
@@ -63,8 +63,8 @@ bool ReadSim(telephony_h handle, SimProperties* sim) {
       Call(handle->bus, handle->modemPath.c_str(), "org.ofono.SimManager", "GetProperties");
   if (reply == nullptr) return false;
   DBusMessageIter it, dict;
-  bool ok = dbus_message_iter_init(reply, &it) &&
-            dbus_message_iter_get_arg_type(&it) == DBUS_TYPE_ARRAY;
+  bool ok =
+      dbus_message_iter_init(reply, &it) && dbus_message_iter_get_arg_type(&it) == DBUS_TYPE_ARRAY;
   if (ok) {
     dbus_message_iter_recurse(&it, &dict);
     while (dbus_message_iter_get_arg_type(&dict) == DBUS_TYPE_DICT_ENTRY) {
@@ -79,8 +79,8 @@ bool ReadSim(telephony_h handle, SimProperties* sim) {
         dbus_bool_t present = FALSE;
         dbus_message_iter_get_basic(&variant, &present);
         sim->present = present;
-      } else if (type == DBUS_TYPE_STRING &&
-                 (strcmp(name, "MobileCountryCode") == 0 || strcmp(name, "MobileNetworkCode") == 0)) {
+      } else if (type == DBUS_TYPE_STRING && (strcmp(name, "MobileCountryCode") == 0 ||
+                                              strcmp(name, "MobileNetworkCode") == 0)) {
         const char* text = nullptr;
         dbus_message_iter_get_basic(&variant, &text);
         (name[6] == 'C' ? sim->mcc : sim->mnc) = text != nullptr ? text : "";

@@ -1,20 +1,19 @@
 // vconf on files: get/set through vconf_store, change notification through inotify on the
 // key's directory (the file itself is replaced by rename on every set), dispatched from a
 // GIOChannel watch on the GLib default main context.
-#include "vconf.h"
-
 #include <glib.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/inotify.h>
 #include <unistd.h>
+#include <vconf.h>
 
 #include <algorithm>
 #include <map>
 #include <string>
 #include <vector>
 
-#include "vconf_store.h"
+#include "platform/host/vconf_store.h"
 
 namespace {
 

@@ -1,4 +1,4 @@
-#include "vconf_store.h"
+#include "platform/host/vconf_store.h"
 
 #include <errno.h>
 #include <fcntl.h>
@@ -10,9 +10,9 @@
 #include <string.h>
 #include <sys/stat.h>
 #include <unistd.h>
+#include <vconf.h>
 
-#include "fixed_path.h"
-#include "vconf.h"
+#include "platform/fixed_path.h"
 
 namespace vconf_store {
 

@@ -1,4 +1,4 @@
-#include "main_loop_glib.h"
+#include "platform/main_loop_glib.h"
 
 #include <Ecore.h>
 

@@ -14,7 +14,7 @@
 #include <string>
 #include <vector>
 
-#include "provider_registry.h"
+#include "include/provider_registry.h"
 #include "storage/db_manager.h"
 
 namespace _CorvaneLogManager {

@@ -8,7 +8,7 @@
 
 #include <algorithm>
 
-#include "app_db_test_env.h"
+#include "tests/collectors/app_db_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {

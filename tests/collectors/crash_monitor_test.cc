@@ -1,8 +1,8 @@
 // CrashMonitor's filter on hand-built signals against the real app and survey databases.
 #include "collectors/crash_monitor.h"
 
-#include "app_db_test_env.h"
 #include "collectors/trusted_sender.h"
+#include "tests/collectors/app_db_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {

@@ -7,11 +7,11 @@
 
 #include <string>
 
-#include "log_manager.h"
-#include "provider_registry.h"
+#include "include/log_manager.h"
+#include "include/provider_registry.h"
 #include "storage/db_manager.h"
 #include "storage/status_snapshot_store.h"
-#include "temp_sysroot.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {

@@ -3,7 +3,7 @@
 #include <stdio.h>
 #include <stdlib.h>
 
-#include "fuzz/bus_statement_checks.h"
+#include "tests/fuzz/bus_statement_checks.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   std::string failed = fuzz_checks::CheckBusStatement(data, size);

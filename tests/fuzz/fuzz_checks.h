@@ -6,17 +6,17 @@
 #include <math.h>
 #include <stdint.h>
 #include <string.h>
+#include <vconf.h>
 
 #include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
 
+#include "platform/host/vconf_store.h"
 #include "providers/provider_bus_guard.h"
 #include "providers/statement_buffer.h"
 #include "reporting/row_splitter.h"
-#include "vconf.h"
-#include "vconf_store.h"
 
 namespace fuzz_checks {
 

@@ -7,9 +7,9 @@
 #include <iterator>
 #include <string>
 
-#include "fuzz/bus_statement_checks.h"
-#include "fuzz/fuzz_checks.h"
 #include "providers/survey_log_providers.h"
+#include "tests/fuzz/bus_statement_checks.h"
+#include "tests/fuzz/fuzz_checks.h"
 
 namespace {
 

@@ -1,4 +1,4 @@
-#include "day_layout.h"
+#include "tools/logmgrctl/day_layout.h"
 
 #include <gtest/gtest.h>
 

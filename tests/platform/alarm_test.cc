@@ -1,12 +1,11 @@
 // Host alarms fire on the GLib main context at their local time, then every interval.
+#include <alarm.h>
 #include <glib.h>
 #include <gtest/gtest.h>
 #include <sys/time.h>
 #include <time.h>
 
 #include <vector>
-
-#include "alarm.h"
 
 namespace {
 

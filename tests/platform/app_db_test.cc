@@ -41,8 +41,9 @@ class AppDbTest : public ::testing::Test {
               bool index = false) {
     sqlite3* conn = nullptr;
     ASSERT_EQ(sqlite3_open(path.c_str(), &conn), SQLITE_OK);
-    ASSERT_EQ(Exec(conn, "CREATE TABLE package_app_info(app_id TEXT PRIMARY KEY, package TEXT NOT "
-                         "NULL, app_exec TEXT NOT NULL)"),
+    ASSERT_EQ(Exec(conn,
+                   "CREATE TABLE package_app_info(app_id TEXT PRIMARY KEY, package TEXT NOT "
+                   "NULL, app_exec TEXT NOT NULL)"),
               SQLITE_OK);
     if (index) {
       ASSERT_EQ(Exec(conn, "CREATE INDEX package_app_info_exec ON package_app_info(app_exec)"),
@@ -81,19 +82,18 @@ class AppDbTest : public ::testing::Test {
     std::string out;
     int count = -1;
     if (pkgmgrinfo_appinfo_filter_create(&filter) != PMINFO_R_OK) return "error";
-    bool ok =
-        pkgmgrinfo_appinfo_filter_add_string(filter, PMINFO_APPINFO_PROP_APP_EXEC, exec.c_str()) ==
-            PMINFO_R_OK &&
-        pkgmgrinfo_appinfo_filter_count(filter, &count) == PMINFO_R_OK &&
-        pkgmgrinfo_appinfo_filter_foreach_appinfo(
-            filter,
-            [](const pkgmgrinfo_appinfo_h app, void* data) {
-              char* id = nullptr;
-              (void)pkgmgrinfo_appinfo_get_appid(app, &id);
-              *static_cast<std::string*>(data) += std::string(id) + ";";
-              return 0;
-            },
-            &out) == PMINFO_R_OK;
+    bool ok = pkgmgrinfo_appinfo_filter_add_string(filter, PMINFO_APPINFO_PROP_APP_EXEC,
+                                                   exec.c_str()) == PMINFO_R_OK &&
+              pkgmgrinfo_appinfo_filter_count(filter, &count) == PMINFO_R_OK &&
+              pkgmgrinfo_appinfo_filter_foreach_appinfo(
+                  filter,
+                  [](const pkgmgrinfo_appinfo_h app, void* data) {
+                    char* id = nullptr;
+                    (void)pkgmgrinfo_appinfo_get_appid(app, &id);
+                    *static_cast<std::string*>(data) += std::string(id) + ";";
+                    return 0;
+                  },
+                  &out) == PMINFO_R_OK;
     (void)pkgmgrinfo_appinfo_filter_destroy(filter);
     return ok ? std::to_string(count) + ":" + out : "error";
   }

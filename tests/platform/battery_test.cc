@@ -7,7 +7,8 @@
 #include <fstream>
 #include <string>
 #include <vector>
-#include "temp_sysroot.h"
+
+#include "tests/temp_sysroot.h"
 
 namespace {
 

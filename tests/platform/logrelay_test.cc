@@ -1,5 +1,6 @@
 // Host log relay's outbox: never reached through a link, never anything but a plain file of
 // its own (modes under any umask are checked through the daemon, in tests/system/test_files).
+#include <corvane_log_relay.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <stdint.h>
@@ -10,8 +11,7 @@
 #include <sstream>
 #include <string>
 
-#include "corvane_log_relay.h"
-#include "temp_sysroot.h"
+#include "tests/temp_sysroot.h"
 
 namespace {
 

@@ -5,14 +5,14 @@
 #include <dbus/dbus.h>
 #include <glib.h>
 #include <gtest/gtest.h>
-#include <stdio.h>
 #include <signal.h>
+#include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 
 #include <string>
 
-#include "main_loop_glib.h"
+#include "platform/main_loop_glib.h"
 
 namespace {
 

@@ -1,5 +1,5 @@
 // Host signal listeners' sender check: which uids count, what the cache keeps and how far.
-#include "sender_trust.h"
+#include "platform/host/sender_trust.h"
 
 #include <gtest/gtest.h>
 

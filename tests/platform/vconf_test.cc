@@ -6,13 +6,13 @@
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
 #include <unistd.h>
+#include <vconf.h>
 
 #include <fstream>
 #include <string>
 
-#include "vconf.h"
-#include "vconf_store.h"
-#include "temp_sysroot.h"
+#include "platform/host/vconf_store.h"
+#include "tests/temp_sysroot.h"
 
 namespace {
 
@@ -33,13 +33,20 @@ TEST_F(VconfTest, ParsesOnlyWellFormedLines) {
     bool ok;
     int type;
   } cases[] = {
-      {"bool 1\n", true, VCONF_TYPE_BOOL},  {"bool 0", true, VCONF_TYPE_BOOL},
-      {"int -42\n", true, VCONF_TYPE_INT},  {"double 2.5\n", true, VCONF_TYPE_DOUBLE},
-      {"string a b c\n", true, VCONF_TYPE_STRING}, {"string \n", true, VCONF_TYPE_STRING},
-      {"bool 2\n", false, 0},               {"int 12x\n", false, 0},
-      {"int 99999999999\n", false, 0},      {"int  5\n", false, 0},
-      {"double nope\n", false, 0},          {"float 1\n", false, 0},
-      {"int\n", false, 0},                  {"", false, 0},
+      {"bool 1\n", true, VCONF_TYPE_BOOL},
+      {"bool 0", true, VCONF_TYPE_BOOL},
+      {"int -42\n", true, VCONF_TYPE_INT},
+      {"double 2.5\n", true, VCONF_TYPE_DOUBLE},
+      {"string a b c\n", true, VCONF_TYPE_STRING},
+      {"string \n", true, VCONF_TYPE_STRING},
+      {"bool 2\n", false, 0},
+      {"int 12x\n", false, 0},
+      {"int 99999999999\n", false, 0},
+      {"int  5\n", false, 0},
+      {"double nope\n", false, 0},
+      {"float 1\n", false, 0},
+      {"int\n", false, 0},
+      {"", false, 0},
       {"string a\nstring b\n", false, 0},
   };
   for (const Case& c : cases) {

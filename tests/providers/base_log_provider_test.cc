@@ -1,4 +1,4 @@
-#include "provider_test_env.h"
+#include "tests/providers/provider_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -167,13 +167,15 @@ TEST_F(BaseLogProviderTest, KeptInsertsStoreAndAnswerAsTheTextWould) {
   sqlite3* raw = nullptr;  // the text statement, on a connection of its own
   ASSERT_EQ(sqlite3_open((sysroot + "/opt/usr/dbspace/.SurveyLog.db").c_str(), &raw), SQLITE_OK);
   auto stored = [&](long long id) {
-    return Query(survey, "SELECT typeof(app_id)||':'||quote(app_id)||'|'||typeof(duration)||':'"
-                         "||quote(duration) FROM use_app_survey WHERE _id=" + std::to_string(id));
+    return Query(survey,
+                 "SELECT typeof(app_id)||':'||quote(app_id)||'|'||typeof(duration)||':'"
+                 "||quote(duration) FROM use_app_survey WHERE _id=" +
+                     std::to_string(id));
   };
   const char* values[] = {
       "'com.example',12", "'12',' 34'", "'x''y''', -0", " NULL , '7' ", "'a',123456789012345678",
-      "'a',-987654321", "'a','3.0'", "'\xC3\xA9\xFF',null", "'',''",
-      "007,8", "-0,-0", "NULL,NULL",  // into the text column: numbers as SQLite writes them
+      "'a',-987654321", "'a','3.0'", "'\xC3\xA9\xFF',null", "'',''", "007,8", "-0,-0",
+      "NULL,NULL",  // into the text column: numbers as SQLite writes them
       // Not plain literals: the text path stores them.
       "'a',1234567890123456789", "'a',99999999999999999999", "'a',1.5", "'a',0x10", "'a',1e3",
       "'a',-'3'", "'a',+4", "'a'||'b',1", "'a' 'b',1", "\"a\",1", "'a',X'41'", "'a',1_000"};
@@ -181,7 +183,8 @@ TEST_F(BaseLogProviderTest, KeptInsertsStoreAndAnswerAsTheTextWould) {
     SCOPED_TRACE(v);
     int32_t rowId = 0;
     int result = useApp->InsertRow("app_id,duration", v, &rowId);
-    std::string text = std::string("INSERT INTO use_app_survey(app_id,duration) VALUES (") + v + ");";
+    std::string text =
+        std::string("INSERT INTO use_app_survey(app_id,duration) VALUES (") + v + ");";
     int rawResult = sqlite3_exec(raw, text.c_str(), nullptr, nullptr, nullptr);
     ASSERT_EQ(result, rawResult == SQLITE_OK ? 0 : -1);
     if (result != 0) continue;
@@ -205,7 +208,9 @@ TEST_F(BaseLogProviderTest, KeptInsertsStoreAndAnswerAsTheTextWould) {
     const char* values;
   } failing[] = {{"_id,app_id", "'x','a'"},  // not an integer for the row id
                  {"_id,app_id", "1,'a'"},    // that row id is taken
-                 {"app_id,duration", "'a'"}, {"app_id", "'a',1"}, {"app_id", "'a"}};
+                 {"app_id,duration", "'a'"},
+                 {"app_id", "'a',1"},
+                 {"app_id", "'a"}};
   for (const auto& f : failing) {
     SCOPED_TRACE(f.values);
     int32_t rowId = 0;
@@ -216,8 +221,9 @@ TEST_F(BaseLogProviderTest, KeptInsertsStoreAndAnswerAsTheTextWould) {
 
   // Around the 1024-byte buffer: a whole text, one cut at its ";" (still a statement), and one
   // cut inside its literal (none).
-  std::string fixed = "INSERT INTO use_app_survey(app_id,timestamp,time_zone) VALUES ('',"
-                      "1234567890123,'Europe/Berlin');";
+  std::string fixed =
+      "INSERT INTO use_app_survey(app_id,timestamp,time_zone) VALUES ('',"
+      "1234567890123,'Europe/Berlin');";
   for (size_t length : {size_t{1023}, size_t{1024}, size_t{1025}}) {
     SCOPED_TRACE(length);
     std::string app(length - fixed.size(), 'v');
@@ -225,8 +231,9 @@ TEST_F(BaseLogProviderTest, KeptInsertsStoreAndAnswerAsTheTextWould) {
     int result = useApp->InsertRow("app_id", ("'" + app + "'").c_str(), &rowId);
     EXPECT_EQ(result, length < 1025 ? 0 : -1);
     if (result == 0) {
-      EXPECT_EQ(Query(survey, "SELECT app_id FROM use_app_survey WHERE _id=" +
-                                  std::to_string(rowId)), app);
+      EXPECT_EQ(
+          Query(survey, "SELECT app_id FROM use_app_survey WHERE _id=" + std::to_string(rowId)),
+          app);
     }
   }
   sqlite3_close(raw);

@@ -1,4 +1,4 @@
-#include "provider_test_env.h"
+#include "tests/providers/provider_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {

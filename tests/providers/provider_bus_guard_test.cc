@@ -10,11 +10,11 @@
 #include <sys/shm.h>
 #include <unistd.h>
 
-#include "base_log_provider.h"
-#include "db_connection.h"
-#include "provider_registry.h"
-#include "provider_test_env.h"
+#include "include/base_log_provider.h"
+#include "include/db_connection.h"
+#include "include/provider_registry.h"
 #include "storage/db_manager.h"
+#include "tests/providers/provider_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {

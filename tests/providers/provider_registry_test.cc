@@ -1,7 +1,7 @@
 #include <new>
 
-#include "provider_test_env.h"
 #include "providers/survey_log_providers.h"
+#include "tests/providers/provider_test_env.h"
 
 // Lets a test fail the n-th non-throwing allocation; off unless armed.
 namespace {

@@ -12,9 +12,9 @@
 #include <string>
 #include <vector>
 
-#include "base_log_provider.h"
-#include "db_connection.h"
-#include "provider_registry.h"
+#include "include/base_log_provider.h"
+#include "include/db_connection.h"
+#include "include/provider_registry.h"
 #include "storage/db_manager.h"
 
 namespace _CorvaneLogManager {

@@ -1,6 +1,6 @@
 #include "providers/server_upload_log_provider.h"
 
-#include "provider_test_env.h"
+#include "tests/providers/provider_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {

@@ -34,8 +34,8 @@ class DeviceIdentityTest : public ::testing::Test {
     ASSERT_NE(mkdtemp(tmpl), nullptr);
     sysroot = tmpl;
     std::string out = Shell(SourceDir() + "/scripts/host-env start " + sysroot +
-                          " --no-x --mock 'ofono={\"MobileCountryCode\": \"450\", "
-                          "\"MobileNetworkCode\": \"05\"}'");
+                            " --no-x --mock 'ofono={\"MobileCountryCode\": \"450\", "
+                            "\"MobileNetworkCode\": \"05\"}'");
     size_t at = out.find("DBUS_SYSTEM_BUS_ADDRESS=");
     ASSERT_NE(at, std::string::npos) << out;
     busAddress = out.substr(at + 24, out.find('\n', at) - at - 24);
@@ -65,9 +65,11 @@ class DeviceIdentityTest : public ::testing::Test {
     std::ofstream(sysroot + path, std::ios::binary) << text;
   }
   void Sim(const std::string& properties) {
-    ASSERT_EQ(Shell("DBUS_SYSTEM_BUS_ADDRESS='" + busAddress + "' gdbus call --system --dest "
-                  "org.ofono --object-path /ril_0 --method org.freedesktop.DBus.Mock."
-                  "UpdateProperties org.ofono.SimManager \"" + properties + "\" 2>&1")
+    ASSERT_EQ(Shell("DBUS_SYSTEM_BUS_ADDRESS='" + busAddress +
+                    "' gdbus call --system --dest "
+                    "org.ofono --object-path /ril_0 --method org.freedesktop.DBus.Mock."
+                    "UpdateProperties org.ofono.SimManager \"" +
+                    properties + "\" 2>&1")
                   .find("<failed>"),
               std::string::npos);
   }

@@ -5,7 +5,7 @@
 
 #include <atomic>
 
-#include "reporting_test_env.h"
+#include "tests/reporting/reporting_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -293,8 +293,8 @@ TEST_F(ReportBuilderTest, AWorkerStoppedInsideATablesRecordsLeavesThemToTheNextR
   ASSERT_EQ(sqlite3_open((sysroot + "/opt/usr/dbspace/.ServerUploaderDB.db").c_str(), &reader),
             SQLITE_OK);
   sqlite3_stmt* count = nullptr;
-  ASSERT_EQ(sqlite3_prepare_v2(reader, "SELECT group_concat(activity) FROM survey_log", -1,
-                               &count, nullptr),
+  ASSERT_EQ(sqlite3_prepare_v2(reader, "SELECT group_concat(activity) FROM survey_log", -1, &count,
+                               nullptr),
             SQLITE_OK);
   ASSERT_EQ(sqlite3_step(count), SQLITE_ROW);
   EXPECT_STREQ(reinterpret_cast<const char*>(sqlite3_column_text(count, 0)), "001,001");

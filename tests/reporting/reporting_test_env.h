@@ -14,9 +14,9 @@
 #include <string>
 #include <vector>
 
-#include "db_connection.h"
-#include "log_manager.h"
-#include "provider_registry.h"
+#include "include/db_connection.h"
+#include "include/log_manager.h"
+#include "include/provider_registry.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
 
@@ -78,8 +78,8 @@ class ReportingTest : public ::testing::Test {
   }
 
   // Local time of a calendar date in the fixed zone, in ms.
-  static int64_t LocalMs(int year, int month, int day, int hour = 0, int minute = 0,
-                         int second = 0, int ms = 0) {
+  static int64_t LocalMs(int year, int month, int day, int hour = 0, int minute = 0, int second = 0,
+                         int ms = 0) {
     struct tm tm = {};
     tm.tm_year = year - 1900;
     tm.tm_mon = month - 1;

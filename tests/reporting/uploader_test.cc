@@ -4,7 +4,7 @@
 #include <unistd.h>
 
 #include "reporting/row_splitter.h"
-#include "reporting_test_env.h"
+#include "tests/reporting/reporting_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -30,7 +30,6 @@ TEST(RowSplitterTest, YieldsEmptyTokensAndNeverNull) {
   EXPECT_EQ(RowSplitter::SplitRows(rows, 0, Uploader::kRecordFields), nullptr);
 }
 
-
 class UploaderTest : public ReportingTest {
  protected:
   void SetUp() override {
@@ -42,9 +41,10 @@ class UploaderTest : public ReportingTest {
   }
 
   void Queue(const std::string& activity, int64_t stamp, const std::string& body = "b") {
-    Exec(upload, "INSERT INTO survey_log(timestamp,svc_code,category_code,activity,log_type,"
-                 "app_version,body) VALUES (" + std::to_string(stamp) + ",'701','999','" +
-                     activity + "','BIZ','W2','" + body + "');");
+    Exec(upload,
+         "INSERT INTO survey_log(timestamp,svc_code,category_code,activity,log_type,"
+         "app_version,body) VALUES (" +
+             std::to_string(stamp) + ",'701','999','" + activity + "','BIZ','W2','" + body + "');");
   }
   // The "4" item of every outbox line, in order.
   std::vector<std::string> SentActivities() {
@@ -75,13 +75,14 @@ TEST_F(UploaderTest, HandsOverAtMostOneBatchInRankOrderWithAllItems) {
   expected.insert(expected.end(), 300, "003");
   expected.insert(expected.end(), 100, "004");
   EXPECT_EQ(SentActivities(), expected);
-  EXPECT_EQ(Column(upload, "SELECT activity||':'||count(*) FROM survey_log GROUP BY activity "
-                           "ORDER BY activity"),
+  EXPECT_EQ(Column(upload,
+                   "SELECT activity||':'||count(*) FROM survey_log GROUP BY activity "
+                   "ORDER BY activity"),
             (std::vector<std::string>{"002:300", "004:200"}));
-  EXPECT_EQ(OutboxLines()[0], "{\"1\": \"BIZ\", \"2\": \"701\", \"3\": " +
-                                  std::to_string(g_testNowMs) +
-                                  ", \"4\": \"007\", \"6\": \"W2\", \"7\": \"b\", \"8\": "
-                                  "\"com.corvane.logmanager\"}");
+  EXPECT_EQ(OutboxLines()[0],
+            "{\"1\": \"BIZ\", \"2\": \"701\", \"3\": " + std::to_string(g_testNowMs) +
+                ", \"4\": \"007\", \"6\": \"W2\", \"7\": \"b\", \"8\": "
+                "\"com.corvane.logmanager\"}");
 }
 
 TEST_F(UploaderTest, OutOfWindowRecordsArePurgedUnsent) {
@@ -133,8 +134,9 @@ TEST_F(UploaderTest, RelayFailureOnTheThirdRecordKeepsTheRestQueued) {
           uploader.SendAll();
           std::string problems;
           if (SentActivities() != std::vector<std::string>{"007", "001"}) problems += "sent; ";
-          if (Column(upload, "SELECT group_concat(activity) FROM survey_log WHERE "
-                             "rly_result IS NULL") != std::vector<std::string>{"002,004,003"})
+          if (Column(upload,
+                     "SELECT group_concat(activity) FROM survey_log WHERE "
+                     "rly_result IS NULL") != std::vector<std::string>{"002,004,003"})
             problems += "queue; ";
           unsetenv("LOGRELAY_FAIL");
           uploader.SendAll();  // the next send takes the rest, once
@@ -147,7 +149,6 @@ TEST_F(UploaderTest, RelayFailureOnTheThirdRecordKeepsTheRestQueued) {
         ::testing::ExitedWithCode(0), "");
   }
 }
-
 
 }  // namespace
 }  // namespace _CorvaneLogManager

@@ -1,5 +1,5 @@
 // DbConnection on real database files in a temp directory.
-#include "db_connection.h"
+#include "include/db_connection.h"
 
 #include <gtest/gtest.h>
 #include <pthread.h>
@@ -236,9 +236,10 @@ TEST_F(DbConnectionTest, CountsAndFailureValues) {
 
 TEST_F(DbConnectionTest, BadFilesAndDirectoriesFailWithoutDamage) {
   std::string junk = dir + "/junk.db";
-  ASSERT_EQ(system(("head -c 4096 /dev/urandom > '" + junk + "' && cp '" + junk + "' '" + junk +
-                     ".orig'").c_str()),
-            0);
+  ASSERT_EQ(
+      system(("head -c 4096 /dev/urandom > '" + junk + "' && cp '" + junk + "' '" + junk + ".orig'")
+                 .c_str()),
+      0);
   DbConnection bad;
   // SQLite reads the header lazily; the open reads it at once, so the file stays closed.
   EXPECT_EQ(bad.Open(junk.c_str()), -1);
@@ -250,7 +251,8 @@ TEST_F(DbConnectionTest, BadFilesAndDirectoriesFailWithoutDamage) {
   EXPECT_EQ(missing.Open((dir + "/no/such/dir/x.db").c_str()), -1);
 
   // A read-only directory holding a database with a row: no new file, and the WAL database
-  // cannot even be read there, so the open fails. Root ignores modes, so a child drops to an unprivileged user.
+  // cannot even be read there, so the open fails. Root ignores modes, so a child drops to an
+  // unprivileged user.
   Setup({"CREATE TABLE t(x);", "INSERT INTO t VALUES('kept');"});
   ASSERT_EQ(conn.Close(), 0);
   ASSERT_EQ(chmod(path.c_str(), 0644), 0);  // made owner-only; the reader below is another user

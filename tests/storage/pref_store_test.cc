@@ -6,7 +6,8 @@
 #include <time.h>
 
 #include <string>
-#include "temp_sysroot.h"
+
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {

@@ -8,7 +8,7 @@
 
 #include <string>
 
-#include "temp_sysroot.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {

@@ -1,10 +1,12 @@
-#include "day_data.h"
+#include "tools/logmgrctl/day_data.h"
 
 #include <sqlite3.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/time.h>
+#include <system_info.h>
+#include <telephony.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -12,11 +14,9 @@
 #include <functional>
 #include <map>
 
-#include "fixed_path.h"
-#include "outbox_view.h"
-#include "system_info.h"
-#include "table_view.h"
-#include "telephony.h"
+#include "platform/fixed_path.h"
+#include "tools/logmgrctl/outbox_view.h"
+#include "tools/logmgrctl/table_view.h"
 
 namespace daypage {
 

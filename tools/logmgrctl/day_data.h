@@ -9,7 +9,7 @@
 #include <utility>
 #include <vector>
 
-#include "day_layout.h"
+#include "tools/logmgrctl/day_layout.h"
 
 namespace daypage {
 

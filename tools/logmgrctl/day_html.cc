@@ -1,4 +1,4 @@
-#include "day_html.h"
+#include "tools/logmgrctl/day_html.h"
 
 #include <stdio.h>
 

@@ -5,7 +5,7 @@
 
 #include <string>
 
-#include "day_data.h"
+#include "tools/logmgrctl/day_data.h"
 
 namespace daypage {
 

@@ -1,4 +1,4 @@
-#include "day_view.h"
+#include "tools/logmgrctl/day_view.h"
 
 #include <errno.h>
 #include <stdio.h>
@@ -7,8 +7,8 @@
 #include <string>
 #include <vector>
 
-#include "day_data.h"
-#include "day_html.h"
+#include "tools/logmgrctl/day_data.h"
+#include "tools/logmgrctl/day_html.h"
 
 namespace daypage {
 namespace {

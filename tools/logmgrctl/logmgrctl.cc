@@ -11,9 +11,9 @@
 #include <utility>
 #include <vector>
 
-#include "day_view.h"
-#include "outbox_view.h"
-#include "table_view.h"
+#include "tools/logmgrctl/day_view.h"
+#include "tools/logmgrctl/outbox_view.h"
+#include "tools/logmgrctl/table_view.h"
 
 namespace {
 

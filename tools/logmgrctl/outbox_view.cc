@@ -1,6 +1,6 @@
 // `logmgrctl outbox`: the relay library's outbox, one block per handed-over record, the body
 // split into its key=value pairs.
-#include "outbox_view.h"
+#include "tools/logmgrctl/outbox_view.h"
 
 #include <stdio.h>
 #include <stdlib.h>
@@ -11,7 +11,7 @@
 #include <map>
 #include <string>
 
-#include "fixed_path.h"
+#include "platform/fixed_path.h"
 
 namespace {
 

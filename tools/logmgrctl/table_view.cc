@@ -1,4 +1,4 @@
-#include "table_view.h"
+#include "tools/logmgrctl/table_view.h"
 
 #include <sqlite3.h>
 #include <stdio.h>
@@ -6,7 +6,7 @@
 
 #include <string>
 
-#include "fixed_path.h"
+#include "platform/fixed_path.h"
 
 namespace {
 

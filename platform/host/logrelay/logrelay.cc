@@ -2,6 +2,7 @@
 // ($SYSROOT/opt/usr/data/log-relay/outbox.jsonl), keys the item numbers as text.
 // LOGRELAY_FAIL="register:N[,create:N][,set:N]" makes the N-th such call of the process fail,
 // so tests can break a hand-over at any position.
+#include <corvane_log_relay.h>
 #include <errno.h>
 #include <fcntl.h>
 #include <stdint.h>
@@ -16,8 +17,7 @@
 #include <new>
 #include <string>
 
-#include "corvane_log_relay.h"
-#include "fixed_path.h"
+#include "platform/fixed_path.h"
 
 #define RELAY_API extern "C" __attribute__((visibility("default")))
 
