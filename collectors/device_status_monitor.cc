@@ -6,7 +6,6 @@
 #include <device/battery.h>
 #include <stdio.h>
 #include <string.h>
-#include <sys/time.h>
 #include <unistd.h>
 #include <vconf.h>
 
@@ -17,9 +16,7 @@
 #include "collectors/trusted_sender.h"
 #include "include/base_log_provider.h"
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
-#include "storage/db_manager.h"
 #include "storage/pref_store.h"
 #include "storage/status_snapshot_store.h"
 
@@ -50,31 +47,6 @@ bool g_screenOff = false;
 const char* g_chargeKind = nullptr;  // "U" or "A" while charging; null when no start was seen
 DBusConnection* g_bus = nullptr;
 
-int64_t NowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<int64_t>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
-
-const char* AppId() { return LogManager::GetInstance()->GetName().c_str(); }
-
-BaseLogProvider* FeatureProvider() {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
-  return registry != nullptr ? registry->Lookup(kFeatureTable) : nullptr;
-}
-
-// One feature row; |value| is null for the events that carry none. Texts are stored verbatim.
-int InsertFeatureRow(BaseLogProvider* provider, const char* code, const char* extra,
-                     const long long* value) {
-  if (provider == nullptr) return -1;
-  char buffer[512];
-  RowValues row(buffer, sizeof(buffer));
-  row.Text(AppId()).Text(code).Text(extra);
-  if (value != nullptr) row.Number(*value);
-  if (row.Get() == nullptr) return -1;
-  return provider->InsertRow(value != nullptr ? kPeriodColumns : kEventColumns, row.Get());
-}
-
 // --- vconf ---------------------------------------------------------------------------------
 
 void OnScreenKey(DeviceStatusMonitor* monitor, int value) {
@@ -100,7 +72,7 @@ void OnEarjackKey(DeviceStatusMonitor* monitor, int value) {
   if (value != 0) {
     (void)monitor->StartFeature("HEAD", "");
   } else {
-    (void)monitor->EndFeature("HEAD", NowMs());
+    (void)monitor->EndFeature("HEAD", monitor->Now());
   }
 }
 
@@ -108,7 +80,7 @@ void OnWifiKey(DeviceStatusMonitor* monitor, int value) {
   if (value == 2) {
     (void)monitor->StartFeature("WIFI", "");
   } else if (value == 0 || value == 1) {
-    (void)monitor->EndFeature("WIFI", NowMs());
+    (void)monitor->EndFeature("WIFI", monitor->Now());
   }
 }
 
@@ -186,12 +158,29 @@ void OnBondCreated(int result, bt_device_info_s* info, void* data) {
 
 void OnBondDestroyed(int result, char*, void* data) {
   if (result != BT_ERROR_NONE || data == nullptr) return;
-  (void)static_cast<DeviceStatusMonitor*>(data)->EndFeature("BLUE", NowMs());
+  DeviceStatusMonitor* monitor = static_cast<DeviceStatusMonitor*>(data);
+  (void)monitor->EndFeature("BLUE", monitor->Now());
 }
 
 }  // namespace
 
 // --- periods and events --------------------------------------------------------------------
+
+DeviceStatusMonitor::DeviceStatusMonitor(ProviderRegistry* registry, PrefStore* prefStore,
+                                         ClockFn clockFn)
+    : providers(registry), prefs(prefStore), clock(clockFn) {}
+
+// One feature row; |value| is null for the events that carry none. Texts are stored verbatim.
+int DeviceStatusMonitor::InsertRow(const char* code, const char* extra, const long long* value) {
+  BaseLogProvider* provider = providers != nullptr ? providers->Lookup(kFeatureTable) : nullptr;
+  if (provider == nullptr) return -1;
+  char buffer[512];
+  RowValues row(buffer, sizeof(buffer));
+  row.Text(appId.c_str()).Text(code).Text(extra);
+  if (value != nullptr) row.Number(*value);
+  if (row.Get() == nullptr) return -1;
+  return provider->InsertRow(value != nullptr ? kPeriodColumns : kEventColumns, row.Get());
+}
 
 int DeviceStatusMonitor::StartFeature(const char* code, const char* extra) {
   if (snapshots == nullptr) return -1;
@@ -199,11 +188,11 @@ int DeviceStatusMonitor::StartFeature(const char* code, const char* extra) {
   int64_t started = 0;
   if (snapshots->Get(code, &openExtra, &started) != 0) return -1;
   if (started > 0) return 0;  // already open: the first start wins
-  return snapshots->Put(code, extra, NowMs()) == 0 ? 0 : -1;
+  return snapshots->Put(code, extra, clock()) == 0 ? 0 : -1;
 }
 
 int DeviceStatusMonitor::EndFeature(const char* code, int64_t endTime) {
-  BaseLogProvider* provider = FeatureProvider();
+  BaseLogProvider* provider = providers != nullptr ? providers->Lookup(kFeatureTable) : nullptr;
   if (provider == nullptr || snapshots == nullptr) return -1;
   std::string extra;
   int64_t started = 0;
@@ -212,14 +201,13 @@ int DeviceStatusMonitor::EndFeature(const char* code, int64_t endTime) {
   int64_t duration = endTime - started;
   if (duration >= 1 && duration <= kMaxPeriodMs) {
     long long value = duration;
-    (void)InsertFeatureRow(provider, code, extra.c_str(), &value);
+    (void)InsertRow(code, extra.c_str(), &value);
   }
   // Written or discarded as implausible, the period is over.
   return snapshots->Put(code, "", 0) == 0 ? 0 : -1;
 }
 
 int DeviceStatusMonitor::RecordChargeState(int connected) {
-  BaseLogProvider* provider = FeatureProvider();
   if (connected == 1) {
     int percent = 0;
     if (device_battery_get_percent(&percent) != DEVICE_ERROR_NONE) return -1;
@@ -228,21 +216,21 @@ int DeviceStatusMonitor::RecordChargeState(int connected) {
     g_chargeKind = usb == 2 ? "U" : "A";
     (void)StartFeature("CHAR", g_chargeKind);
     long long level = percent * 1000LL;
-    (void)InsertFeatureRow(provider, "BAT1", g_chargeKind, &level);
+    (void)InsertRow("BAT1", g_chargeKind, &level);
     return 0;
   }
-  (void)EndFeature("CHAR", NowMs());
+  (void)EndFeature("CHAR", clock());
   int percent = 0;
   if (device_battery_get_percent(&percent) != DEVICE_ERROR_NONE) return -1;
   if (g_chargeKind == nullptr) return -1;  // no BAT2 without a seen start
   long long level = percent * 1000LL;
-  (void)InsertFeatureRow(provider, "BAT2", g_chargeKind, &level);
+  (void)InsertRow("BAT2", g_chargeKind, &level);
   g_chargeKind = nullptr;
   return 0;
 }
 
 int DeviceStatusMonitor::WriteEvent(const char* code) {
-  return InsertFeatureRow(FeatureProvider(), code, "", nullptr) == 0 ? 0 : -1;
+  return InsertRow(code, "", nullptr) == 0 ? 0 : -1;
 }
 
 int DeviceStatusMonitor::RecordUnlock() { return WriteEvent("UNLO"); }
@@ -251,7 +239,7 @@ int DeviceStatusMonitor::RecordCapture() { return WriteEvent("CAPT"); }
 
 int DeviceStatusMonitor::SetScreenState(int on) {
   if (appUsage != nullptr) appUsage->OnScreenState(on);
-  if (on == 0) return EndFeature("SCRN", NowMs());
+  if (on == 0) return EndFeature("SCRN", clock());
   return StartFeature("SCRN", "");
 }
 
@@ -316,19 +304,19 @@ int DeviceStatusMonitor::Stop() {
   return 0;
 }
 
-int DeviceStatusMonitor::Recover() {
+int DeviceStatusMonitor::Recover(StatusSnapshotStore* snapshotStore, DbConnection* survey,
+                                 const std::string& rowAppId) {
   // Once per run: a second pass would close the periods the first one opened.
   if (recovered) return 0;
-  if (RecoverAndSample() != 0) return -1;
+  snapshots = snapshotStore;
+  appId = rowAppId;
+  if (RecoverAndSample(survey) != 0) return -1;
   recovered = true;
   return 0;
 }
 
-int DeviceStatusMonitor::RecoverAndSample() {
-  snapshots = StatusSnapshotStore::GetInstance();
-  if (snapshots == nullptr) return -1;
-  PrefStore* prefs = LogManager::GetInstance()->GetPrefStore();
-  if (prefs == nullptr) return -1;
+int DeviceStatusMonitor::RecoverAndSample(DbConnection* survey) {
+  if (snapshots == nullptr || prefs == nullptr) return -1;
 
   int64_t endTime = 0;
   uint32_t shutdownSeconds = prefs->GetLastShutdownTime();
@@ -338,8 +326,6 @@ int DeviceStatusMonitor::RecoverAndSample() {
     (void)prefs->SetLastShutdownTime(0);
   } else {
     // After a crash: the last moment anything was written.
-    DbManager* manager = DbManager::GetInstance();
-    DbConnection* survey = manager != nullptr ? manager->GetConnection() : nullptr;
     if (survey == nullptr) return -1;
     for (const char* table : kActivityTables) {
       int64_t latest = survey->MaxTimestamp(table);
