@@ -220,8 +220,8 @@ void AppUsageMonitor::OnActiveWindow(int32_t pid) {
   currentPid = pid;
 }
 
-void AppUsageMonitor::OnScreenState(int on) {
-  if (on == 0) {
+void AppUsageMonitor::OnScreenState(bool on) {
+  if (!on) {
     if (tracked.count(currentPid) != 0) (void)Record(currentPid, clock());
     currentPid = kScreenOffPid;
     return;

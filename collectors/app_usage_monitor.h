@@ -21,8 +21,7 @@ class AppUsageMonitor {
   ~AppUsageMonitor();
 
   int Start();
-  // 0: the screen went off, 1: it came on.
-  void OnScreenState(int on);
+  void OnScreenState(bool on);
 
   // Platform handlers.
   static int LaunchHandler(int pid, void* monitor);

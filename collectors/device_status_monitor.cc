@@ -43,33 +43,69 @@ const char* const kActivityTables[] = {"use_app_survey", "manage_app_survey",
 // Periods a previous run may have left open, closed in this order.
 const char* const kRecoveredFeatures[] = {"SCRN", "CHAR", "HEAD", "WIFI", "BLUE"};
 
+// The platform keys read here, each with the values that matter to it.
+const char* const kPmStateKey = "memory/pm/state";
+const int kPmNormal = 1;
+const int kPmDim = 2;  // dimmed, still on
+const int kPmOff = 3;
+const char* const kChargerKey = "memory/sysman/charger_status";
+const int kChargerDisconnected = 0;
+const int kChargerConnected = 1;
+// Connected to a host and usable: the charge comes over USB.
+const char* const kUsbKey = "memory/sysman/usb_status";
+const int kUsbAvailable = 2;
+const char* const kLockKey = "memory/idle_lock/state";
+const int kUnlocked = 0;
+const char* const kEarjackKey = "memory/sysman/earjack";
+const int kEarjackRemoved = 0;
+const int kEarjackThreeWire = 1;
+const int kEarjackFourWire = 3;
+const int kEarjackTvOut = 16;
+const char* const kWifiKey = "memory/dnet/wifi";
+const int kWifiOff = 0;
+const int kWifiUnconnected = 1;
+const int kWifiConnected = 2;
+
+// Charge kinds in the CHAR, BAT1 and BAT2 rows' extra.
+const char* const kChargeUsb = "U";
+const char* const kChargeAc = "A";
+
+// BAT1 and BAT2 rows carry the battery level in thousandths of a percent.
+const long long kLevelPerPercent = 1000;
+// The start is held up this long before a connected charger's state is sampled, deliberately.
+const unsigned kChargeSampleDelaySeconds = 2;
+
+// A bonded device's extra: its major class over its minor class, as one number.
+const int kMajorClassShift = 256;
+
 bool g_screenOff = false;
-const char* g_chargeKind = nullptr;  // "U" or "A" while charging; null when no start was seen
+const char* g_chargeKind = nullptr;  // a charge kind while charging; null when no start was seen
 DBusConnection* g_bus = nullptr;
 
 // --- vconf ---------------------------------------------------------------------------------
 
 void OnScreenKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 1 && g_screenOff) {
+  if (value == kPmNormal && g_screenOff) {
     g_screenOff = false;
-    (void)monitor->SetScreenState(1);
-  } else if (value == 3) {
+    (void)monitor->SetScreenState(true);
+  } else if (value == kPmOff) {
     g_screenOff = true;
-    (void)monitor->SetScreenState(0);
+    (void)monitor->SetScreenState(false);
   }
-  // 2 (dimmed) keeps the screen on; a repeated 1 is not a new period.
+  // Dimmed keeps the screen on; a repeated normal is not a new period.
 }
 
 void OnChargerKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 0 || value == 1) (void)monitor->RecordChargeState(value);
+  if (value == kChargerDisconnected || value == kChargerConnected)
+    (void)monitor->RecordChargeState(value == kChargerConnected);
 }
 
 void OnLockKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 0) (void)monitor->RecordUnlock();
+  if (value == kUnlocked) (void)monitor->RecordUnlock();
 }
 
 void OnEarjackKey(DeviceStatusMonitor* monitor, int value) {
-  if (value != 0) {
+  if (value != kEarjackRemoved) {
     (void)monitor->StartFeature("HEAD", "");
   } else {
     (void)monitor->EndFeature("HEAD", monitor->Now());
@@ -77,9 +113,9 @@ void OnEarjackKey(DeviceStatusMonitor* monitor, int value) {
 }
 
 void OnWifiKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 2) {
+  if (value == kWifiConnected) {
     (void)monitor->StartFeature("WIFI", "");
-  } else if (value == 0 || value == 1) {
+  } else if (value == kWifiOff || value == kWifiUnconnected) {
     (void)monitor->EndFeature("WIFI", monitor->Now());
   }
 }
@@ -92,14 +128,14 @@ struct KeyWatch {
 
 // Registered before the bus filter, then the rest after it.
 const KeyWatch kEarlyKeys[] = {
-    {"memory/pm/state", OnScreenKey},
-    {"memory/sysman/charger_status", OnChargerKey},
+    {kPmStateKey, OnScreenKey},
+    {kChargerKey, OnChargerKey},
     {"db/setting/psmode", nullptr},
 };
 const KeyWatch kLateKeys[] = {
-    {"memory/idle_lock/state", OnLockKey},
-    {"memory/sysman/earjack", OnEarjackKey},
-    {"memory/dnet/wifi", OnWifiKey},
+    {kLockKey, OnLockKey},
+    {kEarjackKey, OnEarjackKey},
+    {kWifiKey, OnWifiKey},
 };
 
 const KeyWatch* FindWatch(const char* key) {
@@ -151,7 +187,7 @@ void OnBondCreated(int result, bt_device_info_s* info, void* data) {
   if (result != BT_ERROR_NONE || info == nullptr || data == nullptr) return;
   char extra[20] = {0};
   (void)snprintf(extra, sizeof(extra), "%d",
-                 static_cast<int>(info->bt_class.major_device_class) * 256 +
+                 static_cast<int>(info->bt_class.major_device_class) * kMajorClassShift +
                      static_cast<int>(info->bt_class.minor_device_class));
   (void)static_cast<DeviceStatusMonitor*>(data)->StartFeature("BLUE", extra);
 }
@@ -207,15 +243,15 @@ int DeviceStatusMonitor::EndFeature(const char* code, int64_t endTime) {
   return snapshots->Put(code, "", 0) == 0 ? 0 : -1;
 }
 
-int DeviceStatusMonitor::RecordChargeState(int connected) {
-  if (connected == 1) {
+int DeviceStatusMonitor::RecordChargeState(bool connected) {
+  if (connected) {
     int percent = 0;
     if (device_battery_get_percent(&percent) != DEVICE_ERROR_NONE) return -1;
     int usb = 0;
-    if (vconf_get_int("memory/sysman/usb_status", &usb) != 0) return -1;
-    g_chargeKind = usb == 2 ? "U" : "A";
+    if (vconf_get_int(kUsbKey, &usb) != 0) return -1;
+    g_chargeKind = usb == kUsbAvailable ? kChargeUsb : kChargeAc;
     (void)StartFeature("CHAR", g_chargeKind);
-    long long level = percent * 1000LL;
+    long long level = percent * kLevelPerPercent;
     (void)InsertRow("BAT1", g_chargeKind, &level);
     return 0;
   }
@@ -223,7 +259,7 @@ int DeviceStatusMonitor::RecordChargeState(int connected) {
   int percent = 0;
   if (device_battery_get_percent(&percent) != DEVICE_ERROR_NONE) return -1;
   if (g_chargeKind == nullptr) return -1;  // no BAT2 without a seen start
-  long long level = percent * 1000LL;
+  long long level = percent * kLevelPerPercent;
   (void)InsertRow("BAT2", g_chargeKind, &level);
   g_chargeKind = nullptr;
   return 0;
@@ -237,9 +273,9 @@ int DeviceStatusMonitor::RecordUnlock() { return WriteEvent("UNLO"); }
 
 int DeviceStatusMonitor::RecordCapture() { return WriteEvent("CAPT"); }
 
-int DeviceStatusMonitor::SetScreenState(int on) {
+int DeviceStatusMonitor::SetScreenState(bool on) {
   if (appUsage != nullptr) appUsage->OnScreenState(on);
-  if (on == 0) return EndFeature("SCRN", clock());
+  if (!on) return EndFeature("SCRN", clock());
   return StartFeature("SCRN", "");
 }
 
@@ -340,23 +376,23 @@ int DeviceStatusMonitor::RecoverAndSample(DbConnection* survey) {
 
   // Initial snapshot; it stops at its first failing step, which does not fail the start.
   int pmState = 0;
-  if (vconf_get_int("memory/pm/state", &pmState) != 0) return 0;
-  if (pmState == 1 || pmState == 2) {
+  if (vconf_get_int(kPmStateKey, &pmState) != 0) return 0;
+  if (pmState == kPmNormal || pmState == kPmDim) {
     g_screenOff = false;
-    if (SetScreenState(1) != 0) return 0;
+    if (SetScreenState(true) != 0) return 0;
   } else {
     g_screenOff = true;
   }
   int charger = 0;
-  if (vconf_get_int("memory/sysman/charger_status", &charger) != 0) return 0;
-  if (charger == 1) {
-    // The start is held up two seconds before the charge is sampled, deliberately.
-    sleep(2);
-    if (RecordChargeState(1) != 0) return 0;
+  if (vconf_get_int(kChargerKey, &charger) != 0) return 0;
+  if (charger == kChargerConnected) {
+    sleep(kChargeSampleDelaySeconds);
+    if (RecordChargeState(true) != 0) return 0;
   }
   int earjack = 0;
-  if (vconf_get_int("memory/sysman/earjack", &earjack) != 0) return 0;
-  if (earjack == 1 || earjack == 3 || earjack == 16) (void)StartFeature("HEAD", "");
+  if (vconf_get_int(kEarjackKey, &earjack) != 0) return 0;
+  if (earjack == kEarjackThreeWire || earjack == kEarjackFourWire || earjack == kEarjackTvOut)
+    (void)StartFeature("HEAD", "");
   return 0;
 }
 

@@ -36,10 +36,10 @@ class DeviceStatusMonitor {
   int StartFeature(const char* code, const char* extra);
   // Closes the open period at |endTime| (ms) and writes its row if its length is plausible.
   int EndFeature(const char* code, int64_t endTime);
-  int RecordChargeState(int connected);
+  int RecordChargeState(bool connected);
   int RecordUnlock();
   int RecordCapture();
-  int SetScreenState(int on);
+  int SetScreenState(bool on);
   int64_t Now() const { return clock(); }
 
  private:

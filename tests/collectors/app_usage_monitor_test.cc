@@ -136,10 +136,10 @@ TEST_F(AppUsageMonitorTest, ExcludedPackagesAreNeverTracked) {
 TEST_F(AppUsageMonitorTest, ScreenOffClosesThePeriodAndScreenOnStartsTheNext) {
   ActivateAt(kT0, alpha);
   g_now = kT0 + 3000;
-  monitor->OnScreenState(0);
+  monitor->OnScreenState(false);
   ActivateAt(kT0 + 4000, beta);  // while off: takes over the foreground, writes nothing
   g_now = kT0 + 10000;
-  monitor->OnScreenState(1);  // no display here: only the period restarts
+  monitor->OnScreenState(true);  // no display here: only the period restarts
   ActivateAt(kT0 + 12000, alpha);
   EXPECT_EQ(Periods(), "pkg.alpha:3000;pkg.beta:2000;");
 }
