@@ -35,12 +35,16 @@ void LogManager::DestroyInstance() {
   g_instance = nullptr;
 }
 
+LogManager::LogManager() = default;
+
+// Components are released by Stop, in its order; what is left here goes in any order.
+LogManager::~LogManager() = default;
+
 int LogManager::Construct() {
-  prefStore = new (std::nothrow) PrefStore();
+  prefStore.reset(new (std::nothrow) PrefStore());
   if (prefStore == nullptr) return -1;
   if (prefStore->Create() == -1) {
-    delete prefStore;
-    prefStore = nullptr;
+    prefStore.reset();
     return -1;
   }
 
@@ -48,10 +52,11 @@ int LogManager::Construct() {
   // though the providers are only made by Init.
   ProviderRegistry* providers = ProviderRegistry::GetInstance();
   if (providers == nullptr) return -1;
-  appUsageMonitor = new (std::nothrow) AppUsageMonitor(providers, WallClockMs);
-  packageMonitor = new (std::nothrow) PackageMonitor(providers);
-  crashMonitor = new (std::nothrow) CrashMonitor(providers);
-  deviceStatusMonitor = new (std::nothrow) DeviceStatusMonitor(providers, prefStore, WallClockMs);
+  appUsageMonitor.reset(new (std::nothrow) AppUsageMonitor(providers, WallClockMs));
+  packageMonitor.reset(new (std::nothrow) PackageMonitor(providers));
+  crashMonitor.reset(new (std::nothrow) CrashMonitor(providers));
+  deviceStatusMonitor.reset(new (std::nothrow)
+                                DeviceStatusMonitor(providers, prefStore.get(), WallClockMs));
   scheduler = new (std::nothrow) ReportScheduler();
   if (appUsageMonitor == nullptr || packageMonitor == nullptr || deviceStatusMonitor == nullptr ||
       crashMonitor == nullptr || scheduler == nullptr) {
@@ -62,15 +67,11 @@ int LogManager::Construct() {
 }
 
 void LogManager::ReleaseMonitors() {
-  delete appUsageMonitor;
-  delete packageMonitor;
-  delete crashMonitor;
-  delete deviceStatusMonitor;
+  appUsageMonitor.reset();
+  packageMonitor.reset();
+  crashMonitor.reset();
+  deviceStatusMonitor.reset();
   delete scheduler;
-  appUsageMonitor = nullptr;
-  packageMonitor = nullptr;
-  crashMonitor = nullptr;
-  deviceStatusMonitor = nullptr;
   scheduler = nullptr;
 }
 
@@ -111,7 +112,7 @@ int LogManager::Start() {
   if (deviceStatusMonitor->Recover(StatusSnapshotStore::GetInstance(), survey, name) != 0 ||
       deviceStatusMonitor->Start() != 0)
     return -1;
-  deviceStatusMonitor->SetAppUsageMonitor(appUsageMonitor);
+  deviceStatusMonitor->SetAppUsageMonitor(appUsageMonitor.get());
   return 0;
 }
 
@@ -131,23 +132,18 @@ void LogManager::Stop() {
   if (uploadDbManager != nullptr) UploadDbManager::CloseInstance();
   if (prefStore != nullptr) {
     (void)prefStore->Close();
-    delete prefStore;
+    prefStore.reset();
   }
   if (registry != nullptr) ProviderRegistry::Release();
 
   if (packageMonitor != nullptr) (void)packageMonitor->Stop();
   if (crashMonitor != nullptr) (void)crashMonitor->Stop();
   if (deviceStatusMonitor != nullptr) (void)deviceStatusMonitor->Stop();
-  delete appUsageMonitor;
-  delete packageMonitor;
-  delete crashMonitor;
-  delete deviceStatusMonitor;
+  appUsageMonitor.reset();
+  packageMonitor.reset();
+  crashMonitor.reset();
+  deviceStatusMonitor.reset();
 
-  prefStore = nullptr;
-  appUsageMonitor = nullptr;
-  packageMonitor = nullptr;
-  crashMonitor = nullptr;
-  deviceStatusMonitor = nullptr;
   registry = nullptr;
   dbManager = nullptr;
   uploadDbManager = nullptr;
