@@ -37,7 +37,7 @@ void LogManager::DestroyInstance() {
 
 LogManager::LogManager() = default;
 
-// Components are released by Stop, in its order; what is left here goes in any order.
+// Stop releases the components in their order; only a destroy without a stop frees any here.
 LogManager::~LogManager() = default;
 
 int LogManager::Construct() {
