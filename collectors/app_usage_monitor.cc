@@ -10,7 +10,6 @@
 #include <stdlib.h>
 #include <string.h>
 #include <sys/syscall.h>
-#include <sys/time.h>
 #include <unistd.h>
 
 #include "collectors/row_values.h"
@@ -30,16 +29,15 @@ const int64_t kMinDeathPeriodMs = 150;
 const size_t kKnownSweepAt = 64;
 const int64_t kMaxPeriodMs = 604799999;  // just under seven days
 
-int64_t SystemNowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<int64_t>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
+// Foreground markers that are no process: no window seen yet, and the screen off (which no
+// activation ends until the screen comes on again).
+const int32_t kNoForegroundPid = -1;
+const int32_t kScreenOffPid = -2;
+// Period start while the foreground is not tracked: far enough back that no row is written.
+const int64_t kUntrackedPeriodStart = -1;
 
-// One monitor per process, so these live beside it rather than in it.
+// One monitor per process, so the handler lives beside it rather than in it.
 Ecore_Event_Handler* g_propertyEventHandler = nullptr;
-int64_t g_periodStart = 0;
-AppUsageMonitor::Clock g_clock = SystemNowMs;
 
 bool IsExcluded(const std::string& packageId) {
   if (packageId.empty()) return true;
@@ -93,7 +91,8 @@ int InstallPropertyHandler(void* monitor) {
 
 }  // namespace
 
-AppUsageMonitor::AppUsageMonitor() : currentPid(-1) {}
+AppUsageMonitor::AppUsageMonitor(ProviderRegistry* registry, ClockFn clockFn)
+    : providers(registry), clock(clockFn), currentPid(kNoForegroundPid) {}
 
 AppUsageMonitor::~AppUsageMonitor() {
   if (g_propertyEventHandler != nullptr) {
@@ -102,8 +101,6 @@ AppUsageMonitor::~AppUsageMonitor() {
   }
   for (auto& entry : known) close(entry.second.pidfd);
 }
-
-void AppUsageMonitor::SetClock(Clock clock) { g_clock = clock != nullptr ? clock : SystemNowMs; }
 
 int AppUsageMonitor::Start() {
   if (listening) return 0;  // a retried start registers once
@@ -180,8 +177,8 @@ int AppUsageMonitor::DeadHandler(int pid, void* data) {
   AppUsageMonitor* monitor = static_cast<AppUsageMonitor*>(data);
   if (monitor == nullptr) return -1;
   // Any tracked process, foreground or not, closes with the time since the period began.
-  int64_t now = g_clock();
-  if (g_periodStart >= 1 && now - g_periodStart >= kMinDeathPeriodMs &&
+  int64_t now = monitor->clock();
+  if (monitor->periodStart >= 1 && now - monitor->periodStart >= kMinDeathPeriodMs &&
       monitor->tracked.count(pid) != 0)
     (void)monitor->Record(pid, now);
   monitor->tracked.erase(pid);
@@ -200,36 +197,36 @@ unsigned char AppUsageMonitor::PropertyHandler(void* data, int, void* event) {
     return ECORE_CALLBACK_PASS_ON;
   int pid = 0;
   if (!ecore_x_netwm_pid_get(active, &pid)) return ECORE_CALLBACK_PASS_ON;
+  // Only a named window is taken for an activation.
   char* name = nullptr;
   (void)ecore_x_netwm_name_get(active, &name);
   if (name == nullptr) return ECORE_CALLBACK_PASS_ON;
-  monitor->OnActiveWindow(pid, name);
   free(name);
+  monitor->OnActiveWindow(pid);
   return ECORE_CALLBACK_PASS_ON;
 }
 
-void AppUsageMonitor::OnActiveWindow(int32_t pid, const char* name) {
+void AppUsageMonitor::OnActiveWindow(int32_t pid) {
   std::string packageId;
   // A window of no application (a system popup) leaves the running period alone on purpose.
   if (!PackageOfPid(pid, &packageId)) return;
   if (!IsExcluded(packageId)) Track(pid, packageId);
-  if (currentPid != pid && currentPid != -2) {
+  if (currentPid != pid && currentPid != kScreenOffPid) {
     // One reading ends the old period and starts the new one, so no time falls between them.
-    int64_t now = g_clock();
+    int64_t now = clock();
     if (tracked.count(currentPid) != 0) (void)Record(currentPid, now);
-    g_periodStart = tracked.count(pid) != 0 ? now : -1;
+    periodStart = tracked.count(pid) != 0 ? now : kUntrackedPeriodStart;
   }
-  currentName = name;
   currentPid = pid;
 }
 
-void AppUsageMonitor::OnScreenState(int on) {
-  if (on == 0) {
-    if (tracked.count(currentPid) != 0) (void)Record(currentPid, g_clock());
-    currentPid = -2;
+void AppUsageMonitor::OnScreenState(bool on) {
+  if (!on) {
+    if (tracked.count(currentPid) != 0) (void)Record(currentPid, clock());
+    currentPid = kScreenOffPid;
     return;
   }
-  g_periodStart = g_clock();
+  periodStart = clock();
   if (ecore_x_init(nullptr) == 0) return;
   int pid = 0;
   if (!ecore_x_netwm_pid_get(ecore_x_window_focus_get(), &pid)) return;
@@ -238,12 +235,10 @@ void AppUsageMonitor::OnScreenState(int on) {
 }
 
 int AppUsageMonitor::Record(int32_t pid, int64_t now) {
-  BaseLogProvider* provider = ProviderRegistry::GetInstance() != nullptr
-                                  ? ProviderRegistry::GetInstance()->Lookup("use_app_survey")
-                                  : nullptr;
+  BaseLogProvider* provider = providers != nullptr ? providers->Lookup("use_app_survey") : nullptr;
   if (provider == nullptr) return -1;
-  // A period of -1 (untracked foreground) lands far above the bound and is dropped here.
-  int64_t duration = now - g_periodStart;
+  // An untracked foreground's period lands far above the bound and is dropped here.
+  int64_t duration = now - periodStart;
   if (duration < 1 || duration > kMaxPeriodMs) return -1;
   char buffer[512];
   const char* values =

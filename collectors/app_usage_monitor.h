@@ -7,29 +7,29 @@
 #include <map>
 #include <string>
 
+#include "base/clock.h"
+
 namespace _CorvaneLogManager {
+
+class ProviderRegistry;
 
 class AppUsageMonitor {
  public:
-  AppUsageMonitor();
+  // Periods are written through |providers|' use_app_survey provider and timed by |clock|.
+  AppUsageMonitor(ProviderRegistry* providers, ClockFn clock);
   // Removes the window property handler; the aul listeners stay until the process ends.
   ~AppUsageMonitor();
 
   int Start();
-  // 0: the screen went off, 1: it came on.
-  void OnScreenState(int on);
+  void OnScreenState(bool on);
 
   // Platform handlers.
   static int LaunchHandler(int pid, void* monitor);
   static int DeadHandler(int pid, void* monitor);
   static unsigned char PropertyHandler(void* monitor, int eventType, void* event);
 
-  // The active window changed to one of |pid| named |name| (steps after the X reads).
-  void OnActiveWindow(int32_t pid, const char* name);
-
-  // Milliseconds since the epoch; replaceable so the period rules can be checked without waiting.
-  using Clock = int64_t (*)();
-  static void SetClock(Clock clock);
+  // The active window changed to one of |pid| (steps after the X reads).
+  void OnActiveWindow(int32_t pid);
 
  private:
   // The package of |pid|'s application into |packageId|; false when it is no application.
@@ -45,10 +45,15 @@ class AppUsageMonitor {
     std::string packageId;
   };
 
+  ProviderRegistry* const providers;
+  const ClockFn clock;
   std::map<int32_t, KnownProcess> known;
   std::map<int32_t, std::string> tracked;
-  std::string currentName;
+  // The foreground process, or one of the markers in the .cc file.
   int32_t currentPid;
+  // Start of the running period in ms; 0 before the first, negative while the foreground is
+  // not tracked.
+  int64_t periodStart = 0;
   bool listening = false;
 };
 

@@ -3,7 +3,6 @@
 #include <dbus/dbus-glib-lowlevel.h>
 #include <glib.h>
 #include <pkgmgr-info.h>
-#include <stdint.h>
 #include <stdio.h>
 #include <string.h>
 
@@ -21,31 +20,32 @@ const char kCrashRule[] = "type='signal',interface='org.tizen.system.crash.Crash
 // The only kind of application error written here.
 const int kErrorTypeCrash = 1;
 
+struct ErrorRows {
+  BaseLogProvider* provider;
+  int errorType;
+};
+
 int RecordApp(const pkgmgrinfo_appinfo_h handle, void* userData) {
+  const ErrorRows* rows = static_cast<const ErrorRows*>(userData);
   char* appId = nullptr;
   (void)pkgmgrinfo_appinfo_get_appid(handle, &appId);
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
-  BaseLogProvider* provider =
-      registry != nullptr ? registry->Lookup("report_app_error_survey") : nullptr;
-  if (provider != nullptr && appId != nullptr) {
+  if (rows->provider != nullptr && appId != nullptr) {
     char buffer[512];
-    const char* values = RowValues(buffer, sizeof(buffer))
-                             .Text(appId)
-                             .Number(static_cast<int>(reinterpret_cast<intptr_t>(userData)))
-                             .Get();
+    const char* values =
+        RowValues(buffer, sizeof(buffer)).Text(appId).Number(rows->errorType).Get();
     // An id too long to store whole is not stored at all.
-    if (values != nullptr) (void)provider->InsertRow("app_id,type", values);
+    if (values != nullptr) (void)rows->provider->InsertRow("app_id,type", values);
   }
   return 0;  // every application sharing the executable gets its row
 }
 
-void RecordAppsOfExecutable(const char* exePath, int errorType) {
+void RecordAppsOfExecutable(BaseLogProvider* provider, const char* exePath, int errorType) {
   pkgmgrinfo_appinfo_filter_h filter = nullptr;
   if (pkgmgrinfo_appinfo_filter_create(&filter) != PMINFO_R_OK) return;
+  ErrorRows rows = {provider, errorType};
   if (pkgmgrinfo_appinfo_filter_add_string(filter, PMINFO_APPINFO_PROP_APP_EXEC, exePath) ==
       PMINFO_R_OK)
-    (void)pkgmgrinfo_appinfo_filter_foreach_appinfo(
-        filter, RecordApp, reinterpret_cast<void*>(static_cast<intptr_t>(errorType)));
+    (void)pkgmgrinfo_appinfo_filter_foreach_appinfo(filter, RecordApp, &rows);
   (void)pkgmgrinfo_appinfo_filter_destroy(filter);
 }
 
@@ -89,7 +89,7 @@ int CrashMonitor::Stop() {
 }
 
 DBusHandlerResult CrashMonitor::CrashFilter(DBusConnection* connection, DBusMessage* message,
-                                            void*) {
+                                            void* monitor) {
   if (!dbus_message_is_signal(message, kCrashInterface, "ProcessCrashed"))
     return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
   DBusError err;
@@ -102,7 +102,10 @@ DBusHandlerResult CrashMonitor::CrashFilter(DBusConnection* connection, DBusMess
     return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
   }
   // Only the platform's crash service may report crashes.
-  if (IsTrustedSender(connection, message)) RecordAppsOfExecutable(exePath, kErrorTypeCrash);
+  ProviderRegistry* providers =
+      monitor != nullptr ? static_cast<CrashMonitor*>(monitor)->providers : nullptr;
+  if (providers != nullptr && IsTrustedSender(connection, message))
+    RecordAppsOfExecutable(providers->Lookup("report_app_error_survey"), exePath, kErrorTypeCrash);
   // Other filters on the shared connection still see the signal.
   return DBUS_HANDLER_RESULT_NOT_YET_HANDLED;
 }

@@ -7,15 +7,21 @@
 
 namespace _CorvaneLogManager {
 
+class ProviderRegistry;
+
 class CrashMonitor {
  public:
+  // Rows are written through |providers|' report_app_error_survey provider.
+  explicit CrashMonitor(ProviderRegistry* providers) : providers(providers) {}
+
   int Start();
   int Stop();
 
   static DBusHandlerResult CrashFilter(DBusConnection* connection, DBusMessage* message,
-                                       void* userData);
+                                       void* monitor);
 
  private:
+  ProviderRegistry* const providers;
   // The system bus while the filter is installed; null otherwise.
   DBusConnection* bus = nullptr;
 };

@@ -6,7 +6,6 @@
 #include <device/battery.h>
 #include <stdio.h>
 #include <string.h>
-#include <sys/time.h>
 #include <unistd.h>
 #include <vconf.h>
 
@@ -17,9 +16,7 @@
 #include "collectors/trusted_sender.h"
 #include "include/base_log_provider.h"
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
-#include "storage/db_manager.h"
 #include "storage/pref_store.h"
 #include "storage/status_snapshot_store.h"
 
@@ -46,69 +43,80 @@ const char* const kActivityTables[] = {"use_app_survey", "manage_app_survey",
 // Periods a previous run may have left open, closed in this order.
 const char* const kRecoveredFeatures[] = {"SCRN", "CHAR", "HEAD", "WIFI", "BLUE"};
 
+// The platform keys read here, each with the values that matter to it.
+const char* const kPmStateKey = "memory/pm/state";
+const int kPmNormal = 1;
+const int kPmDim = 2;  // dimmed, still on
+const int kPmOff = 3;
+const char* const kChargerKey = "memory/sysman/charger_status";
+const int kChargerDisconnected = 0;
+const int kChargerConnected = 1;
+// Connected to a host and usable: the charge comes over USB.
+const char* const kUsbKey = "memory/sysman/usb_status";
+const int kUsbAvailable = 2;
+const char* const kLockKey = "memory/idle_lock/state";
+const int kUnlocked = 0;
+const char* const kEarjackKey = "memory/sysman/earjack";
+const int kEarjackRemoved = 0;
+const int kEarjackThreeWire = 1;
+const int kEarjackFourWire = 3;
+const int kEarjackTvOut = 16;
+const char* const kWifiKey = "memory/dnet/wifi";
+const int kWifiOff = 0;
+const int kWifiUnconnected = 1;
+const int kWifiConnected = 2;
+
+// Charge kinds in the CHAR, BAT1 and BAT2 rows' extra.
+const char* const kChargeUsb = "U";
+const char* const kChargeAc = "A";
+
+// BAT1 and BAT2 rows carry the battery level in thousandths of a percent.
+const long long kLevelPerPercent = 1000;
+// The start is held up this long before a connected charger's state is sampled, deliberately.
+const unsigned kChargeSampleDelaySeconds = 2;
+
+// A bonded device's extra: its major class over its minor class, as one number.
+const int kMajorClassShift = 256;
+
 bool g_screenOff = false;
-const char* g_chargeKind = nullptr;  // "U" or "A" while charging; null when no start was seen
+const char* g_chargeKind = nullptr;  // a charge kind while charging; null when no start was seen
 DBusConnection* g_bus = nullptr;
-
-int64_t NowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<int64_t>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
-
-const char* AppId() { return LogManager::GetInstance()->GetName().c_str(); }
-
-BaseLogProvider* FeatureProvider() {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
-  return registry != nullptr ? registry->Lookup(kFeatureTable) : nullptr;
-}
-
-// One feature row; |value| is null for the events that carry none. Texts are stored verbatim.
-int InsertFeatureRow(BaseLogProvider* provider, const char* code, const char* extra,
-                     const long long* value) {
-  if (provider == nullptr) return -1;
-  char buffer[512];
-  RowValues row(buffer, sizeof(buffer));
-  row.Text(AppId()).Text(code).Text(extra);
-  if (value != nullptr) row.Number(*value);
-  if (row.Get() == nullptr) return -1;
-  return provider->InsertRow(value != nullptr ? kPeriodColumns : kEventColumns, row.Get());
-}
 
 // --- vconf ---------------------------------------------------------------------------------
 
 void OnScreenKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 1 && g_screenOff) {
+  if (value == kPmNormal && g_screenOff) {
     g_screenOff = false;
-    (void)monitor->SetScreenState(1);
-  } else if (value == 3) {
+    (void)monitor->SetScreenState(true);
+  } else if (value == kPmOff) {
     g_screenOff = true;
-    (void)monitor->SetScreenState(0);
+    (void)monitor->SetScreenState(false);
   }
-  // 2 (dimmed) keeps the screen on; a repeated 1 is not a new period.
+  // Dimmed keeps the screen on; a repeated normal is not a new period.
 }
 
 void OnChargerKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 0 || value == 1) (void)monitor->RecordChargeState(value);
+  if (value == kChargerDisconnected || value == kChargerConnected)
+    (void)monitor->RecordChargeState(value == kChargerConnected);
 }
 
 void OnLockKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 0) (void)monitor->RecordUnlock();
+  if (value == kUnlocked) (void)monitor->RecordUnlock();
 }
 
 void OnEarjackKey(DeviceStatusMonitor* monitor, int value) {
-  if (value != 0) {
+  if (value != kEarjackRemoved) {
     (void)monitor->StartFeature("HEAD", "");
   } else {
-    (void)monitor->EndFeature("HEAD", NowMs());
+    (void)monitor->EndFeature("HEAD", monitor->Now());
   }
 }
 
 void OnWifiKey(DeviceStatusMonitor* monitor, int value) {
-  if (value == 2) {
+  if (value == kWifiConnected) {
     (void)monitor->StartFeature("WIFI", "");
-  } else if (value == 0 || value == 1) {
-    (void)monitor->EndFeature("WIFI", NowMs());
+  } else if (value == kWifiOff || value == kWifiUnconnected) {
+    (void)monitor->EndFeature("WIFI", monitor->Now());
   }
 }
 
@@ -120,14 +128,14 @@ struct KeyWatch {
 
 // Registered before the bus filter, then the rest after it.
 const KeyWatch kEarlyKeys[] = {
-    {"memory/pm/state", OnScreenKey},
-    {"memory/sysman/charger_status", OnChargerKey},
+    {kPmStateKey, OnScreenKey},
+    {kChargerKey, OnChargerKey},
     {"db/setting/psmode", nullptr},
 };
 const KeyWatch kLateKeys[] = {
-    {"memory/idle_lock/state", OnLockKey},
-    {"memory/sysman/earjack", OnEarjackKey},
-    {"memory/dnet/wifi", OnWifiKey},
+    {kLockKey, OnLockKey},
+    {kEarjackKey, OnEarjackKey},
+    {kWifiKey, OnWifiKey},
 };
 
 const KeyWatch* FindWatch(const char* key) {
@@ -179,19 +187,36 @@ void OnBondCreated(int result, bt_device_info_s* info, void* data) {
   if (result != BT_ERROR_NONE || info == nullptr || data == nullptr) return;
   char extra[20] = {0};
   (void)snprintf(extra, sizeof(extra), "%d",
-                 static_cast<int>(info->bt_class.major_device_class) * 256 +
+                 static_cast<int>(info->bt_class.major_device_class) * kMajorClassShift +
                      static_cast<int>(info->bt_class.minor_device_class));
   (void)static_cast<DeviceStatusMonitor*>(data)->StartFeature("BLUE", extra);
 }
 
 void OnBondDestroyed(int result, char*, void* data) {
   if (result != BT_ERROR_NONE || data == nullptr) return;
-  (void)static_cast<DeviceStatusMonitor*>(data)->EndFeature("BLUE", NowMs());
+  DeviceStatusMonitor* monitor = static_cast<DeviceStatusMonitor*>(data);
+  (void)monitor->EndFeature("BLUE", monitor->Now());
 }
 
 }  // namespace
 
 // --- periods and events --------------------------------------------------------------------
+
+DeviceStatusMonitor::DeviceStatusMonitor(ProviderRegistry* registry, PrefStore* prefStore,
+                                         ClockFn clockFn)
+    : providers(registry), prefs(prefStore), clock(clockFn) {}
+
+// One feature row; |value| is null for the events that carry none. Texts are stored verbatim.
+int DeviceStatusMonitor::InsertRow(const char* code, const char* extra, const long long* value) {
+  BaseLogProvider* provider = providers != nullptr ? providers->Lookup(kFeatureTable) : nullptr;
+  if (provider == nullptr) return -1;
+  char buffer[512];
+  RowValues row(buffer, sizeof(buffer));
+  row.Text(appId.c_str()).Text(code).Text(extra);
+  if (value != nullptr) row.Number(*value);
+  if (row.Get() == nullptr) return -1;
+  return provider->InsertRow(value != nullptr ? kPeriodColumns : kEventColumns, row.Get());
+}
 
 int DeviceStatusMonitor::StartFeature(const char* code, const char* extra) {
   if (snapshots == nullptr) return -1;
@@ -199,11 +224,11 @@ int DeviceStatusMonitor::StartFeature(const char* code, const char* extra) {
   int64_t started = 0;
   if (snapshots->Get(code, &openExtra, &started) != 0) return -1;
   if (started > 0) return 0;  // already open: the first start wins
-  return snapshots->Put(code, extra, NowMs()) == 0 ? 0 : -1;
+  return snapshots->Put(code, extra, clock()) == 0 ? 0 : -1;
 }
 
 int DeviceStatusMonitor::EndFeature(const char* code, int64_t endTime) {
-  BaseLogProvider* provider = FeatureProvider();
+  BaseLogProvider* provider = providers != nullptr ? providers->Lookup(kFeatureTable) : nullptr;
   if (provider == nullptr || snapshots == nullptr) return -1;
   std::string extra;
   int64_t started = 0;
@@ -212,46 +237,45 @@ int DeviceStatusMonitor::EndFeature(const char* code, int64_t endTime) {
   int64_t duration = endTime - started;
   if (duration >= 1 && duration <= kMaxPeriodMs) {
     long long value = duration;
-    (void)InsertFeatureRow(provider, code, extra.c_str(), &value);
+    (void)InsertRow(code, extra.c_str(), &value);
   }
   // Written or discarded as implausible, the period is over.
   return snapshots->Put(code, "", 0) == 0 ? 0 : -1;
 }
 
-int DeviceStatusMonitor::RecordChargeState(int connected) {
-  BaseLogProvider* provider = FeatureProvider();
-  if (connected == 1) {
+int DeviceStatusMonitor::RecordChargeState(bool connected) {
+  if (connected) {
     int percent = 0;
     if (device_battery_get_percent(&percent) != DEVICE_ERROR_NONE) return -1;
     int usb = 0;
-    if (vconf_get_int("memory/sysman/usb_status", &usb) != 0) return -1;
-    g_chargeKind = usb == 2 ? "U" : "A";
+    if (vconf_get_int(kUsbKey, &usb) != 0) return -1;
+    g_chargeKind = usb == kUsbAvailable ? kChargeUsb : kChargeAc;
     (void)StartFeature("CHAR", g_chargeKind);
-    long long level = percent * 1000LL;
-    (void)InsertFeatureRow(provider, "BAT1", g_chargeKind, &level);
+    long long level = percent * kLevelPerPercent;
+    (void)InsertRow("BAT1", g_chargeKind, &level);
     return 0;
   }
-  (void)EndFeature("CHAR", NowMs());
+  (void)EndFeature("CHAR", clock());
   int percent = 0;
   if (device_battery_get_percent(&percent) != DEVICE_ERROR_NONE) return -1;
   if (g_chargeKind == nullptr) return -1;  // no BAT2 without a seen start
-  long long level = percent * 1000LL;
-  (void)InsertFeatureRow(provider, "BAT2", g_chargeKind, &level);
+  long long level = percent * kLevelPerPercent;
+  (void)InsertRow("BAT2", g_chargeKind, &level);
   g_chargeKind = nullptr;
   return 0;
 }
 
 int DeviceStatusMonitor::WriteEvent(const char* code) {
-  return InsertFeatureRow(FeatureProvider(), code, "", nullptr) == 0 ? 0 : -1;
+  return InsertRow(code, "", nullptr) == 0 ? 0 : -1;
 }
 
 int DeviceStatusMonitor::RecordUnlock() { return WriteEvent("UNLO"); }
 
 int DeviceStatusMonitor::RecordCapture() { return WriteEvent("CAPT"); }
 
-int DeviceStatusMonitor::SetScreenState(int on) {
+int DeviceStatusMonitor::SetScreenState(bool on) {
   if (appUsage != nullptr) appUsage->OnScreenState(on);
-  if (on == 0) return EndFeature("SCRN", NowMs());
+  if (!on) return EndFeature("SCRN", clock());
   return StartFeature("SCRN", "");
 }
 
@@ -316,19 +340,19 @@ int DeviceStatusMonitor::Stop() {
   return 0;
 }
 
-int DeviceStatusMonitor::Recover() {
+int DeviceStatusMonitor::Recover(StatusSnapshotStore* snapshotStore, DbConnection* survey,
+                                 const std::string& rowAppId) {
   // Once per run: a second pass would close the periods the first one opened.
   if (recovered) return 0;
-  if (RecoverAndSample() != 0) return -1;
+  snapshots = snapshotStore;
+  appId = rowAppId;
+  if (RecoverAndSample(survey) != 0) return -1;
   recovered = true;
   return 0;
 }
 
-int DeviceStatusMonitor::RecoverAndSample() {
-  snapshots = StatusSnapshotStore::GetInstance();
-  if (snapshots == nullptr) return -1;
-  PrefStore* prefs = LogManager::GetInstance()->GetPrefStore();
-  if (prefs == nullptr) return -1;
+int DeviceStatusMonitor::RecoverAndSample(DbConnection* survey) {
+  if (snapshots == nullptr || prefs == nullptr) return -1;
 
   int64_t endTime = 0;
   uint32_t shutdownSeconds = prefs->GetLastShutdownTime();
@@ -338,8 +362,6 @@ int DeviceStatusMonitor::RecoverAndSample() {
     (void)prefs->SetLastShutdownTime(0);
   } else {
     // After a crash: the last moment anything was written.
-    DbManager* manager = DbManager::GetInstance();
-    DbConnection* survey = manager != nullptr ? manager->GetConnection() : nullptr;
     if (survey == nullptr) return -1;
     for (const char* table : kActivityTables) {
       int64_t latest = survey->MaxTimestamp(table);
@@ -354,23 +376,23 @@ int DeviceStatusMonitor::RecoverAndSample() {
 
   // Initial snapshot; it stops at its first failing step, which does not fail the start.
   int pmState = 0;
-  if (vconf_get_int("memory/pm/state", &pmState) != 0) return 0;
-  if (pmState == 1 || pmState == 2) {
+  if (vconf_get_int(kPmStateKey, &pmState) != 0) return 0;
+  if (pmState == kPmNormal || pmState == kPmDim) {
     g_screenOff = false;
-    if (SetScreenState(1) != 0) return 0;
+    if (SetScreenState(true) != 0) return 0;
   } else {
     g_screenOff = true;
   }
   int charger = 0;
-  if (vconf_get_int("memory/sysman/charger_status", &charger) != 0) return 0;
-  if (charger == 1) {
-    // The start is held up two seconds before the charge is sampled, deliberately.
-    sleep(2);
-    if (RecordChargeState(1) != 0) return 0;
+  if (vconf_get_int(kChargerKey, &charger) != 0) return 0;
+  if (charger == kChargerConnected) {
+    sleep(kChargeSampleDelaySeconds);
+    if (RecordChargeState(true) != 0) return 0;
   }
   int earjack = 0;
-  if (vconf_get_int("memory/sysman/earjack", &earjack) != 0) return 0;
-  if (earjack == 1 || earjack == 3 || earjack == 16) (void)StartFeature("HEAD", "");
+  if (vconf_get_int(kEarjackKey, &earjack) != 0) return 0;
+  if (earjack == kEarjackThreeWire || earjack == kEarjackFourWire || earjack == kEarjackTvOut)
+    (void)StartFeature("HEAD", "");
   return 0;
 }
 

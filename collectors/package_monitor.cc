@@ -12,12 +12,19 @@ namespace _CorvaneLogManager {
 
 namespace {
 
-// Install, uninstall and upgrade events.
-const int kStatusTypes = 7;
+const int kStatusTypes =
+    PKGMGR_CLIENT_STATUS_INSTALL | PKGMGR_CLIENT_STATUS_UNINSTALL | PKGMGR_CLIENT_STATUS_UPGRADE;
+
+// The type column of manage_app_survey, and the kind of a request not announced.
+const int32_t kKindInstall = 0;
+const int32_t kKindUninstall = 1;
+const int32_t kKindUpdate = 2;
+const int32_t kKindNone = -1;
 
 }  // namespace
 
-PackageMonitor::PackageMonitor() : client(nullptr), pendingType(-1) {
+PackageMonitor::PackageMonitor(ProviderRegistry* registry)
+    : providers(registry), client(nullptr), pendingType(kKindNone) {
   client = pkgmgr_client_new(PC_LISTENING);
 }
 
@@ -52,24 +59,24 @@ int PackageMonitor::StatusHandler(int, const char*, const char* packageId, const
   if (key == nullptr || value == nullptr) return 0;
   if (strcmp(key, "start") == 0) {
     if (strcmp(value, "install") == 0) {
-      monitor->pendingType = 0;
+      monitor->pendingType = kKindInstall;
     } else if (strcmp(value, "uninstall") == 0) {
-      monitor->pendingType = 1;
+      monitor->pendingType = kKindUninstall;
     } else if (strcmp(value, "update") == 0) {
-      monitor->pendingType = 2;
+      monitor->pendingType = kKindUpdate;
     }
   }
   // A failed "end" deliberately keeps the kind pending: a later successful end records it.
-  if (strcmp(key, "end") == 0 && strcmp(value, "ok") == 0 && monitor->pendingType != -1) {
+  if (strcmp(key, "end") == 0 && strcmp(value, "ok") == 0 && monitor->pendingType != kKindNone) {
     (void)monitor->Record(packageId != nullptr ? packageId : "");
-    monitor->pendingType = -1;
+    monitor->pendingType = kKindNone;
   }
   return 0;
 }
 
 int PackageMonitor::Record(const char* packageId) {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
-  BaseLogProvider* provider = registry != nullptr ? registry->Lookup("manage_app_survey") : nullptr;
+  BaseLogProvider* provider =
+      providers != nullptr ? providers->Lookup("manage_app_survey") : nullptr;
   if (provider == nullptr) return -1;
   // The package id comes from whoever sent the status: stored verbatim, or refused when it
   // does not fit whole.

@@ -6,9 +6,12 @@
 
 namespace _CorvaneLogManager {
 
+class ProviderRegistry;
+
 class PackageMonitor {
  public:
-  PackageMonitor();
+  // Rows are written through |providers|' manage_app_survey provider.
+  explicit PackageMonitor(ProviderRegistry* providers);
   ~PackageMonitor();
 
   // 0, or the negative pkgmgr result of listening (the client is then given up).
@@ -22,9 +25,9 @@ class PackageMonitor {
  private:
   int Record(const char* packageId);
 
+  ProviderRegistry* const providers;
   void* client;
-  // Kind announced by the last "start" and not yet recorded: 0 install, 1 uninstall,
-  // 2 update, -1 none.
+  // Kind announced by the last "start" and not yet recorded (the row's type column), or none.
   int32_t pendingType;
   bool listening = false;
 };

@@ -1,9 +1,8 @@
 #include "include/log_manager.h"
 
-#include <sys/time.h>
-
 #include <new>
 
+#include "base/clock.h"
 #include "collectors/app_usage_monitor.h"
 #include "collectors/crash_monitor.h"
 #include "collectors/device_status_monitor.h"
@@ -12,6 +11,7 @@
 #include "reporting/report_scheduler.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
+#include "storage/status_snapshot_store.h"
 
 namespace _CorvaneLogManager {
 
@@ -35,19 +35,28 @@ void LogManager::DestroyInstance() {
   g_instance = nullptr;
 }
 
+LogManager::LogManager() = default;
+
+// Stop releases the components in their order; only a destroy without a stop frees any here.
+LogManager::~LogManager() = default;
+
 int LogManager::Construct() {
-  prefStore = new (std::nothrow) PrefStore();
+  prefStore.reset(new (std::nothrow) PrefStore());
   if (prefStore == nullptr) return -1;
   if (prefStore->Create() == -1) {
-    delete prefStore;
-    prefStore = nullptr;
+    prefStore.reset();
     return -1;
   }
 
-  appUsageMonitor = new (std::nothrow) AppUsageMonitor();
-  packageMonitor = new (std::nothrow) PackageMonitor();
-  crashMonitor = new (std::nothrow) CrashMonitor();
-  deviceStatusMonitor = new (std::nothrow) DeviceStatusMonitor();
+  // The monitors look their providers up when they write, so they take the registry now,
+  // though the providers are only made by Init.
+  ProviderRegistry* providers = ProviderRegistry::GetInstance();
+  if (providers == nullptr) return -1;
+  appUsageMonitor.reset(new (std::nothrow) AppUsageMonitor(providers, WallClockMs));
+  packageMonitor.reset(new (std::nothrow) PackageMonitor(providers));
+  crashMonitor.reset(new (std::nothrow) CrashMonitor(providers));
+  deviceStatusMonitor.reset(new (std::nothrow)
+                                DeviceStatusMonitor(providers, prefStore.get(), WallClockMs));
   scheduler = new (std::nothrow) ReportScheduler();
   if (appUsageMonitor == nullptr || packageMonitor == nullptr || deviceStatusMonitor == nullptr ||
       crashMonitor == nullptr || scheduler == nullptr) {
@@ -58,15 +67,11 @@ int LogManager::Construct() {
 }
 
 void LogManager::ReleaseMonitors() {
-  delete appUsageMonitor;
-  delete packageMonitor;
-  delete crashMonitor;
-  delete deviceStatusMonitor;
+  appUsageMonitor.reset();
+  packageMonitor.reset();
+  crashMonitor.reset();
+  deviceStatusMonitor.reset();
   delete scheduler;
-  appUsageMonitor = nullptr;
-  packageMonitor = nullptr;
-  crashMonitor = nullptr;
-  deviceStatusMonitor = nullptr;
   scheduler = nullptr;
 }
 
@@ -103,8 +108,11 @@ int LogManager::Start() {
   if (packageMonitor != nullptr && packageMonitor->Start() != 0) return -1;
   if (crashMonitor != nullptr && crashMonitor->Start() != 0) return -1;
   if (deviceStatusMonitor == nullptr) return 0;
-  if (deviceStatusMonitor->Recover() != 0 || deviceStatusMonitor->Start() != 0) return -1;
-  deviceStatusMonitor->SetAppUsageMonitor(appUsageMonitor);
+  DbConnection* survey = dbManager != nullptr ? dbManager->GetConnection() : nullptr;
+  if (deviceStatusMonitor->Recover(StatusSnapshotStore::GetInstance(), survey, name) != 0 ||
+      deviceStatusMonitor->Start() != 0)
+    return -1;
+  deviceStatusMonitor->SetAppUsageMonitor(appUsageMonitor.get());
   return 0;
 }
 
@@ -117,33 +125,25 @@ void LogManager::Stop() {
   }
 
   // Written before any database closes, so a restart can close the periods left open.
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  long long nowMs = static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
   if (prefStore != nullptr)
-    (void)prefStore->SetLastShutdownTime(static_cast<int32_t>(nowMs / 1000));
+    (void)prefStore->SetLastShutdownTime(static_cast<int32_t>(WallClockMs() / 1000));
 
   if (dbManager != nullptr) DbManager::CloseInstance();
   if (uploadDbManager != nullptr) UploadDbManager::CloseInstance();
   if (prefStore != nullptr) {
     (void)prefStore->Close();
-    delete prefStore;
+    prefStore.reset();
   }
   if (registry != nullptr) ProviderRegistry::Release();
 
   if (packageMonitor != nullptr) (void)packageMonitor->Stop();
   if (crashMonitor != nullptr) (void)crashMonitor->Stop();
   if (deviceStatusMonitor != nullptr) (void)deviceStatusMonitor->Stop();
-  delete appUsageMonitor;
-  delete packageMonitor;
-  delete crashMonitor;
-  delete deviceStatusMonitor;
+  appUsageMonitor.reset();
+  packageMonitor.reset();
+  crashMonitor.reset();
+  deviceStatusMonitor.reset();
 
-  prefStore = nullptr;
-  appUsageMonitor = nullptr;
-  packageMonitor = nullptr;
-  crashMonitor = nullptr;
-  deviceStatusMonitor = nullptr;
   registry = nullptr;
   dbManager = nullptr;
   uploadDbManager = nullptr;

@@ -3,6 +3,7 @@
 #ifndef LOGMGR_INCLUDE_LOG_MANAGER_H_
 #define LOGMGR_INCLUDE_LOG_MANAGER_H_
 
+#include <memory>
 #include <string>
 
 namespace _CorvaneLogManager {
@@ -32,24 +33,24 @@ class LogManager {
   void Stop();
   void SetName();
 
-  PrefStore* GetPrefStore() const { return prefStore; }
+  PrefStore* GetPrefStore() const { return prefStore.get(); }
   ReportScheduler* GetScheduler() const { return scheduler; }
   bool IsInitialised() const { return initialised; }
   const std::string& GetName() const { return name; }
   std::string GetDeviceId() const;
 
  private:
-  LogManager() = default;
-  ~LogManager() = default;
+  LogManager();
+  ~LogManager();
   int Construct();
   void ReleaseMonitors();
 
-  PrefStore* prefStore = nullptr;
+  std::unique_ptr<PrefStore> prefStore;
   ReportScheduler* scheduler = nullptr;
-  AppUsageMonitor* appUsageMonitor = nullptr;
-  PackageMonitor* packageMonitor = nullptr;
-  CrashMonitor* crashMonitor = nullptr;
-  DeviceStatusMonitor* deviceStatusMonitor = nullptr;
+  std::unique_ptr<AppUsageMonitor> appUsageMonitor;
+  std::unique_ptr<PackageMonitor> packageMonitor;
+  std::unique_ptr<CrashMonitor> crashMonitor;
+  std::unique_ptr<DeviceStatusMonitor> deviceStatusMonitor;
   ProviderRegistry* registry = nullptr;
   DbManager* dbManager = nullptr;
   UploadDbManager* uploadDbManager = nullptr;

@@ -16,16 +16,13 @@
 
 #include "include/provider_registry.h"
 #include "storage/db_manager.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 
 class AppDbTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-apps-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
     unsetenv("DISPLAY");  // window tracking needs X; these tests drive the monitors directly
     setenv("ECORE_NO_SYSTEM_MODULES", "1", 1);  // they would look for a system bus
     ASSERT_EQ(
@@ -45,8 +42,6 @@ class AppDbTest : public ::testing::Test {
     }
     ProviderRegistry::Release();
     DbManager::CloseInstance();
-    unsetenv("LOGMGR_SYSROOT");
-    (void)Sh("rm -rf '" + sysroot + "'");
   }
 
   static int Sh(const std::string& cmd) { return system(cmd.c_str()); }
@@ -107,7 +102,8 @@ class AppDbTest : public ::testing::Test {
     return out;
   }
 
-  std::string sysroot;
+  TempSysroot tmp{"apps"};
+  const std::string sysroot = tmp.path();
   std::vector<pid_t> children;
 };
 

@@ -7,6 +7,7 @@
 #include <sys/syscall.h>
 
 #include <algorithm>
+#include <memory>
 
 #include "tests/collectors/app_db_test_env.h"
 
@@ -23,7 +24,6 @@ class AppUsageMonitorTest : public AppDbTest {
  protected:
   void SetUp() override {
     AppDbTest::SetUp();
-    AppUsageMonitor::SetClock(FakeNow);
     Install("com.ex.alpha", "pkg.alpha", "/opt/usr/apps/alpha/bin/alpha");
     Install("com.ex.beta", "pkg.beta", "/opt/usr/apps/beta/bin/beta");
     Install("com.corvane.lockscreen", "com.corvane.lockscreen", "/opt/usr/apps/lock/bin/lock");
@@ -33,16 +33,15 @@ class AppUsageMonitorTest : public AppDbTest {
     ASSERT_GT(alpha, 0);
     ASSERT_GT(beta, 0);
     ASSERT_GT(lock, 0);
-    monitor = new AppUsageMonitor();
+    monitor.reset(new AppUsageMonitor(ProviderRegistry::GetInstance(), FakeNow));
   }
   void TearDown() override {
-    delete monitor;
-    AppUsageMonitor::SetClock(nullptr);
+    monitor.reset();
     AppDbTest::TearDown();
   }
   void ActivateAt(int64_t at, pid_t pid) {
     g_now = at;
-    monitor->OnActiveWindow(pid, "window");
+    monitor->OnActiveWindow(pid);
   }
   std::string Periods() { return Rows("SELECT app_id, duration FROM use_app_survey ORDER BY _id"); }
 
@@ -78,7 +77,7 @@ class AppUsageMonitorTest : public AppDbTest {
     return static_cast<pid_t>(child);
   }
 
-  AppUsageMonitor* monitor = nullptr;
+  std::unique_ptr<AppUsageMonitor> monitor;
   pid_t alpha = -1, beta = -1, lock = -1;
 };
 
@@ -95,7 +94,7 @@ TEST_F(AppUsageMonitorTest, WritesOnePeriodPerForegroundChange) {
 }
 
 TEST_F(AppUsageMonitorTest, APeriodStartsWhereTheLastOneEnded) {
-  AppUsageMonitor::SetClock(TickingNow);
+  monitor.reset(new AppUsageMonitor(ProviderRegistry::GetInstance(), TickingNow));
   ActivateAt(kT0, alpha);
   ActivateAt(kT0 + 5000, beta);
   ActivateAt(kT0 + 8000, alpha);
@@ -137,10 +136,10 @@ TEST_F(AppUsageMonitorTest, ExcludedPackagesAreNeverTracked) {
 TEST_F(AppUsageMonitorTest, ScreenOffClosesThePeriodAndScreenOnStartsTheNext) {
   ActivateAt(kT0, alpha);
   g_now = kT0 + 3000;
-  monitor->OnScreenState(0);
+  monitor->OnScreenState(false);
   ActivateAt(kT0 + 4000, beta);  // while off: takes over the foreground, writes nothing
   g_now = kT0 + 10000;
-  monitor->OnScreenState(1);  // no display here: only the period restarts
+  monitor->OnScreenState(true);  // no display here: only the period restarts
   ActivateAt(kT0 + 12000, alpha);
   EXPECT_EQ(Periods(), "pkg.alpha:3000;pkg.beta:2000;");
 }
@@ -149,10 +148,10 @@ TEST_F(AppUsageMonitorTest, DeathWritesOnlyAfterTheShortestPeriod) {
   ActivateAt(kT0, beta);
   ActivateAt(kT0 + 10, alpha);  // beta's 10 ms are written; alpha's period starts
   g_now = kT0 + 110;
-  EXPECT_EQ(AppUsageMonitor::DeadHandler(alpha, monitor), 0);  // 100 ms: nothing
+  EXPECT_EQ(AppUsageMonitor::DeadHandler(alpha, monitor.get()), 0);  // 100 ms: nothing
   g_now = kT0 + 2010;
-  EXPECT_EQ(AppUsageMonitor::DeadHandler(beta, monitor), 0);  // not in front, still recorded
-  EXPECT_EQ(AppUsageMonitor::DeadHandler(beta, monitor), 0);  // no longer tracked
+  EXPECT_EQ(AppUsageMonitor::DeadHandler(beta, monitor.get()), 0);  // not in front, still recorded
+  EXPECT_EQ(AppUsageMonitor::DeadHandler(beta, monitor.get()), 0);  // no longer tracked
   EXPECT_EQ(Periods(), "pkg.beta:10;pkg.beta:2000;");
 }
 
@@ -190,7 +189,7 @@ TEST_F(AppUsageMonitorTest, KeepsTheFirstPackageOfAProcessAndSkipsBadLookups) {
   ActivateAt(kT0 + 500, fresh);
   ASSERT_EQ(Sh("echo garbage > '" + sysroot + "/opt/dbspace/.pkgmgr_parser.db'"), 0);
   ActivateAt(kT0 + 600, fresh);
-  EXPECT_EQ(AppUsageMonitor::LaunchHandler(fresh, monitor), -1);
+  EXPECT_EQ(AppUsageMonitor::LaunchHandler(fresh, monitor.get()), -1);
   ActivateAt(kT0 + 650, alpha);
   ASSERT_EQ(Sh("mv '" + sysroot + "/saved.db' '" + sysroot + "/opt/dbspace/.pkgmgr_parser.db'"), 0);
   ActivateAt(kT0 + 1000, fresh);
@@ -208,7 +207,7 @@ TEST_F(AppUsageMonitorTest, APidReusedByAnotherAppIsTheNewApp) {
   ActivateAt(kT0 + 1000, lock);
   Reap(pid);
   g_now = kT0 + 1500;
-  EXPECT_EQ(AppUsageMonitor::DeadHandler(pid, monitor), 0);
+  EXPECT_EQ(AppUsageMonitor::DeadHandler(pid, monitor.get()), 0);
   if (RunAt(pid, "/opt/usr/apps/beta/bin/beta") != pid)
     GTEST_SKIP() << "cannot start a process under a chosen pid here (clone3 set_tid)";
   ActivateAt(kT0 + 2000, pid);

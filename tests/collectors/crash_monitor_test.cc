@@ -55,7 +55,7 @@ class CrashMonitorTest : public AppDbTest {
   }
 
   static constexpr const char* kIface = "org.tizen.system.crash.Crash";
-  CrashMonitor monitor;
+  CrashMonitor monitor{ProviderRegistry::GetInstance()};
 };
 
 TEST_F(CrashMonitorTest, WritesOneRowPerAppOfTheExecutable) {

@@ -7,9 +7,9 @@
 
 #include <string>
 
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
 #include "storage/db_manager.h"
+#include "storage/pref_store.h"
 #include "storage/status_snapshot_store.h"
 #include "tests/temp_sysroot.h"
 
@@ -20,22 +20,19 @@ class DeviceStatusMonitorTest : public ::testing::Test {
  protected:
   void SetUp() override {
     ASSERT_EQ(system(("mkdir -p '" + sysroot + "/opt/usr/dbspace'").c_str()), 0);
-    LogManager* manager = LogManager::GetInstance();
-    ASSERT_NE(manager, nullptr);
-    manager->SetName();
+    ASSERT_EQ(prefs.Create(), 0);
     ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
     ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
-    // No display, charger or headset keys: recovery takes the store and samples nothing.
-    ASSERT_EQ(monitor.Recover(), 0);
     store = StatusSnapshotStore::GetInstance();
     ASSERT_NE(store, nullptr);
+    // No display, charger or headset keys: recovery takes the store and samples nothing.
+    ASSERT_EQ(monitor.Recover(store, DbManager::GetInstance()->GetConnection(), kAppId), 0);
   }
   void TearDown() override {
     ProviderRegistry::Release();
     DbManager::CloseInstance();
     StatusSnapshotStore::DestroyInstance();
-    LogManager::GetInstance()->Stop();
-    LogManager::DestroyInstance();
+    (void)prefs.Close();
   }
   // Feature rows as "app|feature|extra|value;" in insertion order.
   std::string Rows() {
@@ -66,9 +63,11 @@ class DeviceStatusMonitorTest : public ::testing::Test {
     return ts;
   }
 
+  static constexpr const char* kAppId = "com.ex.logger";
   TempSysroot tmp{"device"};
   const std::string sysroot = tmp.path();
-  DeviceStatusMonitor monitor;
+  PrefStore prefs;
+  DeviceStatusMonitor monitor{ProviderRegistry::GetInstance(), &prefs, WallClockMs};
   StatusSnapshotStore* store = nullptr;
 };
 
@@ -84,7 +83,7 @@ TEST_F(DeviceStatusMonitorTest, WritesOnlyPeriodsOfPlausibleLength) {
     int64_t start = OpenedAt("WIFI");
     ASSERT_GT(start, 0);
     ASSERT_EQ(monitor.EndFeature("WIFI", start + c.duration), 0);
-    if (c.written) expected += "com.corvane.logmanager|WIFI||" + std::to_string(c.duration) + ";";
+    if (c.written) expected += std::string(kAppId) + "|WIFI||" + std::to_string(c.duration) + ";";
     EXPECT_EQ(Rows(), expected);
     EXPECT_EQ(OpenedAt("WIFI"), 0);  // closed either way
   }
@@ -98,10 +97,10 @@ TEST_F(DeviceStatusMonitorTest, FirstStartWinsAndClosingTwiceWritesOnce) {
   ASSERT_EQ(monitor.EndFeature("BLUE", start + 2500), 0);
   ASSERT_EQ(monitor.EndFeature("BLUE", start + 5000), 0);
   ASSERT_EQ(monitor.RecordCapture(), 0);
-  EXPECT_EQ(Rows(), "com.corvane.logmanager|BLUE|1025|2500;com.corvane.logmanager|CAPT||NULL;");
+  EXPECT_EQ(Rows(), "com.ex.logger|BLUE|1025|2500;com.ex.logger|CAPT||NULL;");
 
   // Without the store taken by recovery a monitor refuses periods.
-  DeviceStatusMonitor fresh;
+  DeviceStatusMonitor fresh(ProviderRegistry::GetInstance(), &prefs, WallClockMs);
   EXPECT_EQ(fresh.StartFeature("HEAD", ""), -1);
   EXPECT_EQ(fresh.EndFeature("HEAD", start), -1);
 }
@@ -110,7 +109,7 @@ TEST_F(DeviceStatusMonitorTest, ARetriedStartDoesNotRecoverAgain) {
   // A retried daemon start runs recovery again; the periods opened since must stay open.
   ASSERT_EQ(monitor.StartFeature("WIFI", ""), 0);
   int64_t opened = OpenedAt("WIFI");
-  ASSERT_EQ(monitor.Recover(), 0);
+  ASSERT_EQ(monitor.Recover(store, DbManager::GetInstance()->GetConnection(), kAppId), 0);
   EXPECT_EQ(OpenedAt("WIFI"), opened);
   EXPECT_EQ(Rows(), "");
 }

@@ -11,15 +11,13 @@
 
 #include <string>
 
+#include "tests/temp_sysroot.h"
+
 namespace {
 
 class AppDbTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-appdb-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
     ASSERT_EQ(system(("mkdir -p '" + sysroot + "/opt/dbspace'").c_str()), 0);
     db = sysroot + "/opt/dbspace/.pkgmgr_parser.db";
     char exe[PATH_MAX];
@@ -27,11 +25,6 @@ class AppDbTest : public ::testing::Test {
     ASSERT_GT(n, 0);
     self.assign(exe, static_cast<size_t>(n));
   }
-  void TearDown() override {
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf '" + sysroot + "'").c_str());
-  }
-
   static int Exec(sqlite3* conn, const std::string& sql) {
     return sqlite3_exec(conn, sql.c_str(), nullptr, nullptr, nullptr);
   }
@@ -98,7 +91,9 @@ class AppDbTest : public ::testing::Test {
     return ok ? std::to_string(count) + ":" + out : "error";
   }
 
-  std::string sysroot, db, self;
+  TempSysroot tmp{"appdb"};
+  const std::string sysroot = tmp.path();
+  std::string db, self;
 };
 
 TEST_F(AppDbTest, AnswersFollowTheFileReplacedOrWrittenInPlace) {
