@@ -4,14 +4,12 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
-#include <sys/time.h>
 
 #include <initializer_list>
 
 #include "base/clock.h"
 #include "include/base_log_provider.h"
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
 #include "include/sql_literal.h"
 #include "reporting/row_splitter.h"
@@ -141,45 +139,32 @@ struct SelectedRows {
 
 }  // namespace
 
-int64_t SystemClockMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<int64_t>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
-
 void ReportBuilder::SetSliceMode(bool on) { g_sliceMode = on; }
 bool ReportBuilder::SliceMode() { return g_sliceMode; }
 
-PrefStore* ReportBuilder::Prefs() const {
-  if (prefStore != nullptr) return prefStore;
-  LogManager* manager = LogManager::GetInstance();
-  return manager != nullptr ? manager->GetPrefStore() : nullptr;
+BaseLogProvider* ReportBuilder::Provider(const char* table) const {
+  return context.providers != nullptr ? context.providers->Lookup(table) : nullptr;
+}
+
+DbConnection* ReportBuilder::QueueConnection() const {
+  return context.queue != nullptr ? context.queue->GetConnection() : nullptr;
 }
 
 const char* ReportBuilder::AppVersion() const {
   return identity.Firmware() != nullptr ? identity.Firmware() : kDefaultVersion;
 }
 
-namespace {
-
-DbConnection* QueueConnection() {
-  UploadDbManager* manager = UploadDbManager::GetInstance();
-  return manager != nullptr ? manager->GetConnection() : nullptr;
-}
-
-}  // namespace
-
 int ReportBuilder::RunDaily() {
-  if (!GetRuntimeSwitch(1)) return -1;
+  if (!context.ReportEnabled()) return -1;
   // A worker stopped inside a table's transaction leaves it open; its records were never
   // committed and that table's rows are still there, so dropping them loses nothing.
   DbConnection* queueConn = QueueConnection();
   if (queueConn != nullptr && queueConn->RollBackOpenTransaction() != 0) return -1;
   (void)identity.Refresh();
   headReady = false;  // the identity may have changed
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return -1;
-  time_t now = static_cast<time_t>((clockFn != nullptr ? clockFn() : SystemClockMs()) / 1000);
+  time_t now = context.NowSeconds();
   time_t limit = LocalMidnightDaysBefore(now, 1);
   time_t day = static_cast<time_t>(prefs->NormaliseSentDate());
   if (day == 0) return -1;
@@ -259,7 +244,7 @@ int ReportBuilder::AggregateWindows(const Aggregation& agg, time_t day) {
     }
     char where[256];
     snprintf(where, sizeof(where), "timestamp >= %s and timestamp < %s", windowStart, windowEnd);
-    BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(agg.table);
+    BaseLogProvider* provider = Provider(agg.table);
     if (provider == nullptr) return -1;
     SelectedRows selected;
     int rc = agg.grouped
@@ -366,13 +351,13 @@ int ReportBuilder::WriteRecord(const char* activity, const char* body) {
   // The summary counts what the day produced, stored or not.
   sizeTally[activity] += static_cast<int32_t>(strlen(body)) + kTallyExtra;
 
-  BaseLogProvider* queue = ProviderRegistry::GetInstance()->Lookup("server_upload");
+  BaseLogProvider* queue = Provider("server_upload");
   if (queue == nullptr) return -1;
   return queue->InsertRow(kRecordColumns, values);
 }
 
 int ReportBuilder::PurgeTable(const char* table, const char* bound) {
-  BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(table);
+  BaseLogProvider* provider = Provider(table);
   if (provider == nullptr) return -1;
   char where[256];
   snprintf(where, sizeof(where), "timestamp < %s", bound);

@@ -28,23 +28,24 @@
 #include <string>
 
 #include "reporting/device_identity.h"
+#include "reporting/report_context.h"
 
 namespace _CorvaneLogManager {
 
+class BaseLogProvider;
+class DbConnection;
 class PrefStore;
 struct Aggregation;
-
-// Milliseconds since the epoch; injectable so day boundaries can be tested.
-typedef int64_t (*ReportClock)();
-int64_t SystemClockMs();
 
 class ReportBuilder {
  public:
   static constexpr size_t kBodySize = 4096;
   static constexpr size_t kDateSize = 80;
 
-  ReportBuilder() = default;
+  explicit ReportBuilder(const ReportContext& context) : context(context) {}
   ~ReportBuilder() = default;
+  ReportBuilder(const ReportBuilder&) = delete;
+  ReportBuilder& operator=(const ReportBuilder&) = delete;
 
   // Aggregates every day after key_sent_date up to yesterday, oldest first, advancing the
   // sent date after each. 0 when all due days were done; -1 otherwise (the failed day is
@@ -67,15 +68,15 @@ class ReportBuilder {
   static void SetSliceMode(bool on);
   static bool SliceMode();
 
-  // Defaults: LogManager's store and the system clock.
-  void SetPrefStore(PrefStore* store) { prefStore = store; }
-  void SetClock(ReportClock clock) { clockFn = clock; }
   const DeviceIdentity& Identity() const { return identity; }
   // "99.02.00" until the firmware is known.
   const char* AppVersion() const;
 
  private:
-  PrefStore* Prefs() const;
+  // The registry's provider of |table|; null when missing.
+  BaseLogProvider* Provider(const char* table) const;
+  // Null without a queue: a record then fails at its insert.
+  DbConnection* QueueConnection() const;
   // One table's day: its records in one queue transaction, then the purge of its rows.
   int Aggregate(const Aggregation& agg, time_t day);
   int AggregateWindows(const Aggregation& agg, time_t day);
@@ -91,8 +92,7 @@ class ReportBuilder {
   char windowEnd[24] = "";
   std::map<std::string, int32_t> sizeTally;
   DeviceIdentity identity;
-  PrefStore* prefStore = nullptr;
-  ReportClock clockFn = nullptr;
+  const ReportContext context;
   std::string bodyHead;
   std::string recordVersion;
   bool headReady = false;

@@ -6,7 +6,6 @@
 #include <stdlib.h>
 #include <string.h>
 #include <sys/sysinfo.h>
-#include <sys/time.h>
 #include <vconf.h>
 
 #include <new>
@@ -15,7 +14,6 @@
 #include "include/base_log_provider.h"
 #include "include/daemon_lifecycle.h"
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
 #include "reporting/report_builder.h"
 #include "reporting/row_splitter.h"
@@ -37,22 +35,6 @@ const long kWeekSeconds = 604800;
 
 ReportPair* g_reportPair = nullptr;
 
-long long NowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
-
-ReportScheduler* CurrentScheduler() {
-  LogManager* manager = LogManager::GetInstance();
-  return manager != nullptr ? manager->GetScheduler() : nullptr;
-}
-
-PrefStore* Prefs() {
-  LogManager* manager = LogManager::GetInstance();
-  return manager != nullptr ? manager->GetPrefStore() : nullptr;
-}
-
 // The dates are rendered as the device's log would show them; nothing is logged, so the
 // texts go nowhere.
 void RenderDate(time_t when) {
@@ -62,20 +44,20 @@ void RenderDate(time_t when) {
     (void)strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%S%z", &tm);
 }
 
-int OnAlarm(alarm_id_t id, void*) {
-  ReportScheduler* scheduler = CurrentScheduler();
+int OnAlarm(alarm_id_t id, void* data) {
+  auto* scheduler = static_cast<ReportScheduler*>(data);
   if (scheduler == nullptr || id != scheduler->AlarmId()) return 0;
   scheduler->HandleEvent(ReportScheduler::kAlarm);
   return 0;
 }
 
-void OnDumpRequest(keynode_t*, void*) {
-  ReportScheduler* scheduler = CurrentScheduler();
+void OnDumpRequest(keynode_t*, void* data) {
+  auto* scheduler = static_cast<ReportScheduler*>(data);
   if (scheduler != nullptr) scheduler->HandleEvent(ReportScheduler::kDumpContext);
 }
 
-void OnTimeChanged(keynode_t*, void*) {
-  ReportScheduler* scheduler = CurrentScheduler();
+void OnTimeChanged(keynode_t*, void* data) {
+  auto* scheduler = static_cast<ReportScheduler*>(data);
   if (scheduler != nullptr) scheduler->HandleEvent(ReportScheduler::kTimeChanged);
 }
 
@@ -91,14 +73,14 @@ void* WorkerEntry(void*) {
 
 }  // namespace
 
-ReportPair* ReportPair::Get() {
+ReportPair* ReportPair::Get(const ReportContext& context) {
   if (g_reportPair != nullptr) return g_reportPair;
   ReportPair* pair = new (std::nothrow) ReportPair();
   if (pair == nullptr) return nullptr;
   g_reportPair = pair;
-  pair->builder = new (std::nothrow) ReportBuilder();
+  pair->builder = new (std::nothrow) ReportBuilder(context);
   if (pair->builder != nullptr && pair->uploader == nullptr) {
-    pair->uploader = new (std::nothrow) Uploader();
+    pair->uploader = new (std::nothrow) Uploader(context);
   }
   if (pair->builder == nullptr || pair->uploader == nullptr) {
     delete pair->builder;
@@ -120,17 +102,18 @@ void ReportPair::Destroy() {
   g_reportPair = nullptr;
 }
 
-time_t ReportScheduler::MidnightDaysAgo(int days) {
-  return LocalMidnightDaysBefore(time(nullptr), days);
+time_t ReportScheduler::MidnightDaysAgo(int days) const {
+  return LocalMidnightDaysBefore(context.NowSeconds(), days);
 }
 
-int ReportScheduler::Create() {
+int ReportScheduler::Create(const ReportContext& reportContext) {
+  context = reportContext;
   alarmEntry = nullptr;
   alarmId = 0;
   running = false;
   worker = 0;
   workerStarted = false;
-  reportPair = ReportPair::Get();
+  reportPair = ReportPair::Get(context);
   return reportPair != nullptr ? 0 : -1;
 }
 
@@ -146,7 +129,7 @@ void ReportScheduler::CreateAlarm(int interval) {
   alarmEntry = alarmmgr_create_alarm();
   bool ok = alarmEntry != nullptr && alarmmgr_set_cb(OnAlarm, this) == 0;
   if (ok) {
-    time_t start = time(nullptr) + kFirstAlarmDelay;
+    time_t start = context.NowSeconds() + kFirstAlarmDelay;
     struct tm tm;
     ok = localtime_r(&start, &tm) != nullptr;
     alarm_date_t date = {tm.tm_year + 1900, tm.tm_mon + 1, tm.tm_mday,
@@ -167,10 +150,10 @@ void ReportScheduler::CreateAlarm(int interval) {
 }
 
 void ReportScheduler::RegisterWatches() {
-  (void)vconf_notify_key_changed(kTimeChangedKey, OnTimeChanged, nullptr);
+  (void)vconf_notify_key_changed(kTimeChangedKey, OnTimeChanged, this);
   int dump = 0;
   if (vconf_get_bool(kDumpKey, &dump) == -1) (void)vconf_set_bool(kDumpKey, 0);
-  (void)vconf_notify_key_changed(kDumpKey, OnDumpRequest, nullptr);
+  (void)vconf_notify_key_changed(kDumpKey, OnDumpRequest, this);
 }
 
 void ReportScheduler::Stop() {
@@ -184,12 +167,11 @@ void ReportScheduler::Stop() {
   if (running.load() && workerStarted && pthread_cancel(worker) == 0) {
     // The worker may sit inside a statement with cancellation off: interrupting both
     // connections makes that statement fail, and the worker ends itself there.
-    UploadDbManager* upload = UploadDbManager::GetInstance();
-    if (upload != nullptr && upload->GetConnection() != nullptr)
-      upload->GetConnection()->Interrupt();
-    DbManager* survey = DbManager::GetInstance();
-    if (survey != nullptr && survey->GetConnection() != nullptr)
-      survey->GetConnection()->Interrupt();
+    for (DatabaseOwner* owner : {static_cast<DatabaseOwner*>(context.queue),
+                                 static_cast<DatabaseOwner*>(context.survey)}) {
+      if (owner != nullptr && owner->GetConnection() != nullptr)
+        owner->GetConnection()->Interrupt();
+    }
   }
   // Also a finished worker: it may still be re-checking consent, and the pair, the
   // connections and LogManager go away right after this.
@@ -220,10 +202,10 @@ void ReportScheduler::HandleEvent(int kind) {
 }
 
 int ReportScheduler::ClampSentDate(bool forced) {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return -1;
   long long sent = prefs->GetSentDate();
-  time_t now = time(nullptr);
+  time_t now = context.NowSeconds();
   struct tm tm;
   if (localtime_r(&now, &tm) == nullptr) return -1;
   if (sent == 0) return prefs->SetSentDate(static_cast<int32_t>(MidnightDaysAgo(1)));
@@ -239,7 +221,7 @@ int ReportScheduler::ClampSentDate(bool forced) {
 }
 
 void ReportScheduler::CheckReportDue() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return;
   long long sent = prefs->GetSentDate();
   RenderDate(static_cast<time_t>(sent));
@@ -265,7 +247,7 @@ void ReportScheduler::JoinFinishedWorker() {
 
 int ReportScheduler::RunJob() {
   if (reportPair == nullptr) return -1;
-  if (GetRuntimeSwitch(1) && reportPair->builder != nullptr &&
+  if (context.ReportEnabled() && reportPair->builder != nullptr &&
       reportPair->builder->RunDaily() == 0 && reportPair->uploader != nullptr) {
     reportPair->uploader->SendAll();
   }
@@ -275,24 +257,23 @@ int ReportScheduler::RunJob() {
 }
 
 void ReportScheduler::CheckWeeklyPurge() {
-  PrefStore* prefs = Prefs();
-  long long now = NowMs();
+  PrefStore* prefs = context.prefs;
+  long long now = context.NowMs();
   long long stored = prefs != nullptr ? prefs->GetDeleteDate() : -1;
   if (stored != -1 && now - stored <= kWeekMs) return;
-  DbManager* survey = DbManager::GetInstance();
-  if (survey == nullptr) return;
-  (void)survey->NotifyDeleteExpired();
+  if (context.survey == nullptr) return;
+  (void)context.survey->NotifyDeleteExpired();
   if (prefs != nullptr) (void)prefs->SetDeleteDate(now);
 }
 
 void ReportScheduler::ResetAfterTimeChange() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs != nullptr) (void)prefs->SetDeleteDate(0);  // the next run purges
   (void)ClampSentDate(true);
 }
 
 void ReportScheduler::DumpContext() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return;
   (void)prefs->SetDeleteDate(0);
   int days = 0;
@@ -305,9 +286,9 @@ void ReportScheduler::DumpContext() {
 }
 
 void ReportScheduler::CheckWeeklyStatusCopy() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return;
-  time_t now = time(nullptr);
+  time_t now = context.NowSeconds();
   struct tm tm;
   if (localtime_r(&now, &tm) == nullptr) return;
   long t = static_cast<long>(mktime(&tm));
@@ -323,7 +304,7 @@ void ReportScheduler::CheckWeeklyStatusCopy() {
 }
 
 void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
+  ProviderRegistry* registry = context.providers;
   if (registry == nullptr) return;
   BaseLogProvider* status = registry->Lookup("report_app_status_survey");
   BaseLogProvider* feature = registry->Lookup("use_app_feature_survey");
@@ -352,23 +333,21 @@ void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
   }
   if (rowCount > 0) delete[] rows;
 
-  DbManager* survey = DbManager::GetInstance();
-  if (survey != nullptr && survey->GetConnection() != nullptr) {
-    (void)survey->GetConnection()->Exec("delete from report_app_status_survey;");
+  if (context.survey != nullptr && context.survey->GetConnection() != nullptr) {
+    (void)context.survey->GetConnection()->Exec("delete from report_app_status_survey;");
   }
 }
 
 void ReportScheduler::AddSdCardRow() {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
+  ProviderRegistry* registry = context.providers;
   BaseLogProvider* feature =
       registry != nullptr ? registry->Lookup("use_app_feature_survey") : nullptr;
   if (feature == nullptr) return;
   int mmc = 0;
   if (vconf_get_int(kMmcKey, &mmc) != 0) return;
-  LogManager* manager = LogManager::GetInstance();
   char values[512];
-  (void)snprintf(values, sizeof values, "'%s','%s',%d",
-                 manager != nullptr ? manager->GetName().c_str() : "", "SDCA", mmc >= 1 ? 1000 : 0);
+  (void)snprintf(values, sizeof values, "'%s','%s',%d", context.AppId(), "SDCA",
+                 mmc >= 1 ? 1000 : 0);
   (void)feature->InsertRow("app_id,feature,value", values);
 }
 
@@ -380,12 +359,12 @@ int ReportScheduler::StampSurveyUpdate() {
   struct sysinfo info;
   int err = sysinfo(&info);
   if (err != 0) return err;
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   return prefs != nullptr ? prefs->SetSurveyUpdateDate(static_cast<int32_t>(info.uptime)) : -1;
 }
 
 bool ReportScheduler::IsSurveyUpdateDue() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   struct sysinfo info;
   if (prefs == nullptr || sysinfo(&info) != 0) return false;
   long stamp = prefs->GetSurveyUpdateDate();
@@ -393,7 +372,7 @@ bool ReportScheduler::IsSurveyUpdateDue() {
 }
 
 bool ReportScheduler::IsSentDateStale() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   return prefs != nullptr && static_cast<long long>(prefs->GetSentDate()) != MidnightDaysAgo(1);
 }
 

@@ -9,6 +9,8 @@
 
 #include <atomic>
 
+#include "reporting/report_context.h"
+
 namespace _CorvaneLogManager {
 
 class ReportBuilder;
@@ -19,9 +21,10 @@ struct ReportPair {
   ReportBuilder* builder = nullptr;
   Uploader* uploader = nullptr;
 
-  // Made on first request; a failed request still leaves the holder registered, so a later
-  // request returns it as it stands (deliberately no second attempt). Null on failure.
-  static ReportPair* Get();
+  // Made on first request from |context|; a failed request still leaves the holder registered,
+  // so a later request returns it as it stands (deliberately no second attempt). Null on
+  // failure.
+  static ReportPair* Get(const ReportContext& context);
   static void Destroy();
 };
 
@@ -29,8 +32,8 @@ class ReportScheduler {
  public:
   enum Event { kDumpContext = 0, kTimeChanged = 1, kCheck = 2, kAlarm = 3 };
 
-  // Zero the fields and obtain the report pair. 0 / -1.
-  int Create();
+  // Zero the fields, keep |reportContext| and obtain the report pair with it. 0 / -1.
+  int Create(const ReportContext& reportContext);
   // Alarm, sent-date clamp, first due check, watches. Always 0.
   int Init();
   // Alarm removed, worker cancelled and joined, pair destroyed, watches removed.
@@ -58,10 +61,9 @@ class ReportScheduler {
   bool IsSurveyUpdateDue();
   bool IsSentDateStale();
 
-  // Local midnight |days| days before today.
-  static time_t MidnightDaysAgo(int days);
-
  private:
+  // Local midnight |days| days before today, on the handed clock.
+  time_t MidnightDaysAgo(int days) const;
   void CreateAlarm(int interval);
   void RegisterWatches();
   void ResetAfterTimeChange();
@@ -73,6 +75,7 @@ class ReportScheduler {
   // Joins a worker that has finished its run (running is false), so no thread is left behind.
   void JoinFinishedWorker();
 
+  ReportContext context;
   alarm_entry_t* alarmEntry = nullptr;
   alarm_id_t alarmId = 0;
   ReportPair* reportPair = nullptr;

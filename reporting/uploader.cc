@@ -6,7 +6,6 @@
 
 #include <new>
 
-#include "include/log_manager.h"
 #include "providers/server_upload_log_provider.h"
 #include "reporting/row_splitter.h"
 
@@ -61,10 +60,8 @@ std::string Uploader::RankOrder() {
   return text + "END ";
 }
 
-int64_t Uploader::NowMs() const { return clockFn != nullptr ? clockFn() : SystemClockMs(); }
-
 void Uploader::SendAll() {
-  if (builder == nullptr || queue == nullptr || !GetRuntimeSwitch(1)) return;
+  if (builder == nullptr || queue == nullptr || !context.ReportEnabled()) return;
   PurgeOutOfWindow();
   // A record marked by a send that was cut short (a kill between mark and delete) was handed
   // over already: it goes now instead of being handed over again.
@@ -74,7 +71,7 @@ void Uploader::SendAll() {
 }
 
 void Uploader::PurgeOutOfWindow() {
-  int64_t now = NowMs();
+  int64_t now = context.NowMs();
   time_t seconds = static_cast<time_t>(now / 1000);
   struct tm tm;
   if (localtime_r(&seconds, &tm) == nullptr) return;
@@ -105,14 +102,11 @@ void Uploader::SendBatch(uint32_t limit) {
     FreeRows(rows, rowCount);
     return;
   }
-  if (appId.empty()) {
-    LogManager* manager = LogManager::GetInstance();
-    if (manager != nullptr) appId = manager->GetName();
-  }
+  const char* appId = context.AppId();
 
   for (int i = 0; i < rowCount; ++i) {
     char** record = fields + static_cast<size_t>(i) * kRecordFields;
-    int64_t nowMs = NowMs();
+    int64_t nowMs = context.NowMs();
     time_t seconds = static_cast<time_t>(nowMs / 1000);
 
     corvane_log_item_h handle = nullptr;
@@ -120,7 +114,7 @@ void Uploader::SendBatch(uint32_t limit) {
     const struct {
       int item;
       const void* value;
-    } items[] = {{CORVANE_LOG_ITEM_APP_ID, appId.c_str()},
+    } items[] = {{CORVANE_LOG_ITEM_APP_ID, appId},
                  {CORVANE_LOG_ITEM_LOG_TYPE, record[kLogType]},
                  {CORVANE_LOG_ITEM_SVC_CODE, record[kSvcCode]},
                  {CORVANE_LOG_ITEM_TIME, &nowMs},

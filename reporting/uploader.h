@@ -9,6 +9,7 @@
 #include <string>
 
 #include "reporting/report_builder.h"
+#include "reporting/report_context.h"
 
 namespace _CorvaneLogManager {
 
@@ -21,7 +22,7 @@ class Uploader {
   // activity, log_type, app_version, body, rly_result.
   static constexpr int kRecordFields = 9;
 
-  Uploader() = default;
+  explicit Uploader(const ReportContext& context) : context(context) {}
   ~Uploader();
   Uploader(const Uploader&) = delete;
   Uploader& operator=(const Uploader&) = delete;
@@ -38,20 +39,14 @@ class Uploader {
   // "CASE activity WHEN '007' THEN 0 ... END " (ends in a blank: LIMIT follows directly).
   static std::string RankOrder();
 
-  // Defaults: the system clock and LogManager's application id.
-  void SetClock(ReportClock clock) { clockFn = clock; }
-  void SetAppId(const char* id) { appId = id != nullptr ? id : ""; }
-
  private:
-  int64_t NowMs() const;
   void PurgeOutOfWindow();
   void SendBatch(uint32_t limit);
   void DeleteSent();
 
   ServerUploadLogProvider* queue = nullptr;
   ReportBuilder* builder = nullptr;
-  ReportClock clockFn = nullptr;
-  std::string appId;
+  const ReportContext context;
 };
 
 }  // namespace _CorvaneLogManager
