@@ -12,7 +12,6 @@
 
 #include "base/clock.h"
 #include "include/base_log_provider.h"
-#include "include/daemon_lifecycle.h"
 #include "include/db_connection.h"
 #include "include/provider_registry.h"
 #include "reporting/report_builder.h"
@@ -66,8 +65,8 @@ Eina_Bool OnRandomTimer(void* data) {
   return ECORE_CALLBACK_CANCEL;
 }
 
-void* WorkerEntry(void*) {
-  (void)RecheckConsentAfterJob();
+void* WorkerEntry(void* data) {
+  static_cast<ReportScheduler*>(data)->RunAndEnd();
   return nullptr;
 }
 
@@ -243,6 +242,10 @@ void ReportScheduler::JoinFinishedWorker() {
   if (!workerStarted) return;
   (void)pthread_join(worker, nullptr);
   workerStarted = false;
+}
+
+void ReportScheduler::RunAndEnd() {
+  if (RunJob() == 0 && runEndHook != nullptr) runEndHook(runEndData);
 }
 
 int ReportScheduler::RunJob() {

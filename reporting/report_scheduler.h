@@ -31,6 +31,9 @@ struct ReportPair {
 class ReportScheduler {
  public:
   enum Event { kDumpContext = 0, kTimeChanged = 1, kCheck = 2, kAlarm = 3 };
+  // Called on the worker at the end of every run, once running is cleared, with the data
+  // given along with it.
+  using RunEndHook = void (*)(void* data);
 
   // Zero the fields, keep |reportContext| and obtain the report pair with it. 0 / -1.
   int Create(const ReportContext& reportContext);
@@ -38,11 +41,15 @@ class ReportScheduler {
   int Init();
   // Alarm removed, worker cancelled and joined, pair destroyed, watches removed.
   void Stop();
+  // The owner's step at the end of a run; install before Init. None by default.
+  void SetRunEndHook(RunEndHook hook, void* data) {
+    runEndHook = hook;
+    runEndData = data;
+  }
   // Drops the event while a run is in progress or for an unknown kind.
   void HandleEvent(int kind);
-  // The job body run on the worker: report and upload, weekly purge, running cleared.
-  // -1 when there is no report pair.
-  int RunJob();
+  // The worker's body: the run, then (when there was a report pair) the end hook.
+  void RunAndEnd();
   // True from the moment a run is decided until the worker has finished it. Read by the main
   // loop, cleared by the worker: the flag hands the PrefStore dates and the report pair from
   // one thread to the other, so it is sequentially consistent.
@@ -62,6 +69,8 @@ class ReportScheduler {
   bool IsSentDateStale();
 
  private:
+  // Report and upload, weekly purge, running cleared. -1 when there is no report pair.
+  int RunJob();
   // Local midnight |days| days before today, on the handed clock.
   time_t MidnightDaysAgo(int days) const;
   void CreateAlarm(int interval);
@@ -76,6 +85,8 @@ class ReportScheduler {
   void JoinFinishedWorker();
 
   ReportContext context;
+  RunEndHook runEndHook = nullptr;
+  void* runEndData = nullptr;
   alarm_entry_t* alarmEntry = nullptr;
   alarm_id_t alarmId = 0;
   ReportPair* reportPair = nullptr;
