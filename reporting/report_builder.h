@@ -32,6 +32,13 @@
 
 namespace _CorvaneLogManager {
 
+// Record activity codes: one per collection table, and the day's size summary.
+inline constexpr char kActivityUseApp[] = "001";
+inline constexpr char kActivityFeature[] = "002";
+inline constexpr char kActivityManage[] = "003";
+inline constexpr char kActivityError[] = "004";
+inline constexpr char kActivitySummary[] = "007";
+
 class BaseLogProvider;
 class DbConnection;
 class PrefStore;
@@ -41,6 +48,9 @@ class ReportBuilder {
  public:
   static constexpr size_t kBodySize = 4096;
   static constexpr size_t kDateSize = 80;
+  // ComputeWindow's modes.
+  static constexpr int kWholeDay = 0;
+  static constexpr int kHourWindow = 2;
 
   explicit ReportBuilder(const ReportContext& context) : context(context) {}
   ~ReportBuilder() = default;
@@ -52,9 +62,9 @@ class ReportBuilder {
   // repeated by the next run; its records already queued stay, so it may queue them twice).
   int RunDaily();
 
-  // Window of day start |day| (local midnight, seconds): mode 0 is the whole day up to
-  // 23:59:59 (the last second deliberately outside); mode 2 is |lengthHours| from
-  // |offsetHours|. Sets the window texts (ms).
+  // Window of day start |day| (local midnight, seconds): kWholeDay is the day up to 23:59:59
+  // (the last second deliberately outside); kHourWindow is |lengthHours| from |offsetHours|.
+  // Sets the window texts (ms).
   void ComputeWindow(time_t day, int mode, int offsetHours, int lengthHours);
   const char* WindowStart() const { return windowStart; }
   const char* WindowEnd() const { return windowEnd; }

@@ -27,10 +27,22 @@ namespace {
 const char kTimeChangedKey[] = "memory/system/timechanged";
 const char kDumpKey[] = "db/corvane-log-manager/dumpcontext";
 const char kMmcKey[] = "memory/appservice/mmc";
-const int kAlarmInterval = 7200;
-const int kFirstAlarmDelay = 180;
-const long long kWeekMs = 604799999LL;
-const long kWeekSeconds = 604800;
+const char kStatusTable[] = "report_app_status_survey";
+const char kFeatureTable[] = "use_app_feature_survey";
+const char kSdCardFeature[] = "SDCA";
+const int kSdCardPresent = 1000;
+const int kAlarmInterval = 7200;   // seconds between due checks
+const int kFirstAlarmDelay = 180;  // seconds from start to the first alarm
+// The one-shot timer's delay: a random second within this span after the minimum.
+const int kRandomDelayMin = 3600;
+const int kRandomDelaySpan = 7200;
+const long long kPurgeIntervalMs = 604799999LL;  // a week less a millisecond
+const long kStatusCopyIntervalSeconds = 604800;  // a week
+// After a time change a sent date more than three days behind yesterday gives up the days
+// before the oldest one caught up.
+const long kCatchUpSeconds = 259199;
+const int kOldestDayCaughtUp = 4;         // midnight this many days ago
+const long kSurveyUpdateSeconds = 43199;  // uptime before a survey update is due
 
 ReportPair* g_reportPair = nullptr;
 
@@ -208,14 +220,14 @@ int ReportScheduler::ClampSentDate(bool forced) {
   struct tm tm;
   if (localtime_r(&now, &tm) == nullptr) return -1;
   if (sent == 0) return prefs->SetSentDate(static_cast<int32_t>(MidnightDaysAgo(1)));
+  time_t oldest = MidnightDaysAgo(kOldestDayCaughtUp);
   if (!forced) {
-    time_t m4 = MidnightDaysAgo(4);
-    if (sent < m4) return prefs->SetSentDate(static_cast<int32_t>(m4));
+    if (sent < oldest) return prefs->SetSentDate(static_cast<int32_t>(oldest));
     return 0;
   }
-  time_t m1 = MidnightDaysAgo(1);
-  if (sent > m1) return prefs->SetSentDate(static_cast<int32_t>(m1));
-  if (m1 - sent > 259199) return prefs->SetSentDate(static_cast<int32_t>(MidnightDaysAgo(4)));
+  time_t yesterday = MidnightDaysAgo(1);
+  if (sent > yesterday) return prefs->SetSentDate(static_cast<int32_t>(yesterday));
+  if (yesterday - sent > kCatchUpSeconds) return prefs->SetSentDate(static_cast<int32_t>(oldest));
   return 0;
 }
 
@@ -263,7 +275,7 @@ void ReportScheduler::CheckWeeklyPurge() {
   PrefStore* prefs = context.prefs;
   long long now = context.NowMs();
   long long stored = prefs != nullptr ? prefs->GetDeleteDate() : -1;
-  if (stored != -1 && now - stored <= kWeekMs) return;
+  if (stored != -1 && now - stored <= kPurgeIntervalMs) return;
   if (context.survey == nullptr) return;
   (void)context.survey->NotifyDeleteExpired();
   if (prefs != nullptr) (void)prefs->SetDeleteDate(now);
@@ -300,7 +312,7 @@ void ReportScheduler::CheckWeeklyStatusCopy() {
     (void)prefs->SetReportDate(static_cast<int32_t>(t));
     return;
   }
-  if (r != 0 && t - r < kWeekSeconds) return;
+  if (r != 0 && t - r < kStatusCopyIntervalSeconds) return;
   CopyStatusSnapshot(r);
   AddSdCardRow();
   (void)prefs->SetReportDate(static_cast<int32_t>(t));
@@ -309,22 +321,21 @@ void ReportScheduler::CheckWeeklyStatusCopy() {
 void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
   ProviderRegistry* registry = context.providers;
   if (registry == nullptr) return;
-  BaseLogProvider* status = registry->Lookup("report_app_status_survey");
-  BaseLogProvider* feature = registry->Lookup("use_app_feature_survey");
+  BaseLogProvider* status = registry->Lookup(kStatusTable);
+  BaseLogProvider* feature = registry->Lookup(kFeatureTable);
   if (status == nullptr || feature == nullptr) return;
 
   // Seconds compared with millisecond timestamps: every row qualifies. Kept as it is.
   char where[512];
   (void)snprintf(where, sizeof where, "timestamp>%ld", lowerBound);
-  int rowCount = 0;
-  char** rows = nullptr;
-  if (status->SelectGroupedRows("app_id,feature,extra,value", where, nullptr, nullptr, &rowCount,
-                                &rows) != 0) {
+  QueryRows rows;
+  if (status->SelectGroupedRows("app_id,feature,extra,value", where, nullptr, nullptr, &rows.count,
+                                &rows.rows) != 0) {
     return;
   }
-  for (int i = 0; i < rowCount; ++i) {
+  for (int i = 0; i < rows.count; ++i) {
     char* cursor = nullptr;
-    char* appId = RowSplitter::Next(rows[i], ",", &cursor);
+    char* appId = RowSplitter::Next(rows.rows[i], ",", &cursor);
     char* code = RowSplitter::Next(nullptr, ",", &cursor);
     char* extra = RowSplitter::Next(nullptr, ",", &cursor);
     char* value = RowSplitter::Next(nullptr, ",", &cursor);
@@ -332,9 +343,7 @@ void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
     (void)snprintf(values, sizeof values, "'%s','%s','%s',%d", appId, code, extra,
                    static_cast<int>(strtol(value, nullptr, 10)));
     (void)feature->InsertRow("app_id,feature,extra,value", values);
-    delete[] rows[i];
   }
-  if (rowCount > 0) delete[] rows;
 
   if (context.survey != nullptr && context.survey->GetConnection() != nullptr) {
     (void)context.survey->GetConnection()->Exec("delete from report_app_status_survey;");
@@ -343,19 +352,19 @@ void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
 
 void ReportScheduler::AddSdCardRow() {
   ProviderRegistry* registry = context.providers;
-  BaseLogProvider* feature =
-      registry != nullptr ? registry->Lookup("use_app_feature_survey") : nullptr;
+  BaseLogProvider* feature = registry != nullptr ? registry->Lookup(kFeatureTable) : nullptr;
   if (feature == nullptr) return;
   int mmc = 0;
   if (vconf_get_int(kMmcKey, &mmc) != 0) return;
   char values[512];
-  (void)snprintf(values, sizeof values, "'%s','%s',%d", context.AppId(), "SDCA",
-                 mmc >= 1 ? 1000 : 0);
+  (void)snprintf(values, sizeof values, "'%s','%s',%d", context.AppId(), kSdCardFeature,
+                 mmc >= 1 ? kSdCardPresent : 0);
   (void)feature->InsertRow("app_id,feature,value", values);
 }
 
 void ReportScheduler::AddRandomTimer() {
-  (void)ecore_timer_add(static_cast<double>(rand() % 7200 + 3600), OnRandomTimer, this);
+  (void)ecore_timer_add(static_cast<double>(rand() % kRandomDelaySpan + kRandomDelayMin),
+                        OnRandomTimer, this);
 }
 
 int ReportScheduler::StampSurveyUpdate() {
@@ -371,7 +380,7 @@ bool ReportScheduler::IsSurveyUpdateDue() {
   struct sysinfo info;
   if (prefs == nullptr || sysinfo(&info) != 0) return false;
   long stamp = prefs->GetSurveyUpdateDate();
-  return stamp == 0 || info.uptime - stamp > 43199;
+  return stamp == 0 || info.uptime - stamp > kSurveyUpdateSeconds;
 }
 
 bool ReportScheduler::IsSentDateStale() {

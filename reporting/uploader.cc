@@ -6,6 +6,8 @@
 
 #include <new>
 
+#include "base/clock.h"
+#include "include/db_connection.h"
 #include "providers/server_upload_log_provider.h"
 #include "reporting/row_splitter.h"
 
@@ -21,19 +23,16 @@ struct Rank {
   const char* activity;
   const char* then;
 };
-const Rank kRanks[] = {{"007", "' THEN 0 "},
-                       {"001", "' THEN 1 "},
-                       {"003", "' THEN 2 "},
-                       {"004", "' THEN 3 "},
-                       {"002", "' THEN 4 "}};
+const Rank kRanks[] = {{kActivitySummary, "' THEN 0 "},
+                       {kActivityUseApp, "' THEN 1 "},
+                       {kActivityManage, "' THEN 2 "},
+                       {kActivityError, "' THEN 3 "},
+                       {kActivityFeature, "' THEN 4 "}};
+// Records stamped before midnight this many days ago are dropped unsent.
+constexpr int kKeptDays = 3;
+constexpr char kSentMark[] = "success";
 
 enum Field { kId, kTimestamp, kSvcCode, kCategory, kActivity, kLogType, kAppVersion, kBody };
-
-void FreeRows(char** rows, int rowCount) {
-  if (rows == nullptr) return;
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
-}
 
 }  // namespace
 
@@ -72,15 +71,9 @@ void Uploader::SendAll() {
 
 void Uploader::PurgeOutOfWindow() {
   int64_t now = context.NowMs();
-  time_t seconds = static_cast<time_t>(now / 1000);
-  struct tm tm;
-  if (localtime_r(&seconds, &tm) == nullptr) return;
-  tm.tm_hour = 0;
-  tm.tm_min = 0;
-  tm.tm_sec = 0;
-  tm.tm_mday -= 3;
-  tm.tm_isdst = -1;
-  long long lower = static_cast<long long>(mktime(&tm)) * 1000;
+  time_t oldest = LocalMidnightDaysBefore(static_cast<time_t>(now / 1000), kKeptDays);
+  if (oldest == 0) return;  // no local time
+  long long lower = static_cast<long long>(oldest) * 1000;
   char where[100];
   snprintf(where, sizeof(where), " timestamp < %lld or timestamp > %lld", lower,
            static_cast<long long>(now));
@@ -88,23 +81,18 @@ void Uploader::PurgeOutOfWindow() {
 }
 
 void Uploader::SendBatch(uint32_t limit) {
-  int rowCount = 0;
-  char** rows = nullptr;
+  QueryRows rows;
   std::string order = RankOrder();
-  if (queue->SelectLimitedRows(kQueueColumns, nullptr, order.c_str(), limit, &rowCount, &rows) !=
-          0 ||
-      rows == nullptr) {
-    FreeRows(rows, rowCount);
+  if (queue->SelectLimitedRows(kQueueColumns, nullptr, order.c_str(), limit, &rows.count,
+                               &rows.rows) != 0 ||
+      rows.rows == nullptr) {
     return;
   }
-  char** fields = SplitRows(rows, rowCount);
-  if (fields == nullptr) {
-    FreeRows(rows, rowCount);
-    return;
-  }
+  char** fields = SplitRows(rows.rows, rows.count);
+  if (fields == nullptr) return;
   const char* appId = context.AppId();
 
-  for (int i = 0; i < rowCount; ++i) {
+  for (int i = 0; i < rows.count; ++i) {
     char** record = fields + static_cast<size_t>(i) * kRecordFields;
     int64_t nowMs = context.NowMs();
     time_t seconds = static_cast<time_t>(nowMs / 1000);
@@ -139,7 +127,7 @@ void Uploader::SendBatch(uint32_t limit) {
 
     char where[100];
     snprintf(where, sizeof(where), "_id = %s", record[kId]);
-    if (queue->UpdateRows("rly_result", "success", where) != 0) break;
+    if (queue->UpdateRows("rly_result", kSentMark, where) != 0) break;
 
     // Rendered as the hand-over log line would be; nothing is logged.
     char stamp[100];
@@ -149,12 +137,11 @@ void Uploader::SendBatch(uint32_t limit) {
     }
   }
   delete[] fields;
-  FreeRows(rows, rowCount);
 }
 
 void Uploader::DeleteSent() {
   char where[100];
-  snprintf(where, sizeof(where), "rly_result = '%s'", "success");
+  snprintf(where, sizeof(where), "rly_result = '%s'", kSentMark);
   (void)queue->DeleteRows(where);
 }
 
