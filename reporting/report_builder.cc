@@ -6,6 +6,7 @@
 #include <string.h>
 
 #include <initializer_list>
+#include <memory>
 
 #include "base/clock.h"
 #include "include/base_log_provider.h"
@@ -108,7 +109,8 @@ const Aggregation kAggregations[] = {
 
 #undef LOGMGR_CLAMPED_SUM
 
-bool g_sliceMode = true;
+// Slice mode, on as shipped: the usage tables in eight 3-hour windows with COUNT and SUM.
+constexpr bool kSliceMode = true;
 
 // 0 when the time cannot be rendered.
 size_t RenderDate(time_t seconds, char* out, size_t size) {
@@ -150,9 +152,6 @@ void AppendTexts(char* buf, size_t size, size_t* len, std::initializer_list<cons
 }
 
 }  // namespace
-
-void ReportBuilder::SetSliceMode(bool on) { g_sliceMode = on; }
-bool ReportBuilder::SliceMode() { return g_sliceMode; }
 
 BaseLogProvider* ReportBuilder::Provider(const char* table) const {
   return context.providers != nullptr ? context.providers->Lookup(table) : nullptr;
@@ -243,7 +242,7 @@ int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
 }
 
 int ReportBuilder::AggregateWindows(const Aggregation& agg, time_t day) {
-  bool slice = g_sliceMode && agg.slice.windows > 0;
+  bool slice = kSliceMode && agg.slice.windows > 0;
   const Grouping& grouping = slice ? agg.slice.grouping : agg.plain;
   char columns[320];
   snprintf(columns, sizeof(columns), "%s%s", agg.columns, grouping.aggregate);
@@ -281,14 +280,13 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
   while (agg.keys[keyCount] != nullptr) ++keyCount;
   bool hasSum = slice && agg.slice.sumReplacesLastKey;
   int fieldCount = 1 + keyCount + (agg.grouped ? 1 : 0) + (hasSum ? 1 : 0);
-  char** fields = RowSplitter::SplitRows(&rowText, 1, fieldCount);
+  std::unique_ptr<char*[]> fields(RowSplitter::SplitRows(&rowText, 1, fieldCount));
   if (fields == nullptr) return -1;
 
   // An aggregated group has no single time of its own: slice records carry the window end.
   long long stamp = slice ? strtoll(windowEnd, nullptr, 10) : strtoll(fields[0], nullptr, 10);
   char date[kDateSize];
   if (RenderDate(static_cast<time_t>(stamp / 1000), date, sizeof(date)) == 0) {
-    delete[] fields;
     return 0;  // skipped silently
   }
 
@@ -303,7 +301,6 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
     bool first = !agg.grouped && k == 0;
     AppendTexts(body, sizeof(body), &len, {first ? "" : kSeparator, agg.keys[k], "=", value});
   }
-  delete[] fields;
   return WriteRecord(agg.activity, body);
 }
 

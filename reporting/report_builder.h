@@ -69,20 +69,13 @@ class ReportBuilder {
   const char* WindowStart() const { return windowStart; }
   const char* WindowEnd() const { return windowEnd; }
 
+ private:
   // Deletes rows of the provider |table| with timestamp < |bound|. 0 / -1.
   int PurgeTable(const char* table, const char* bound);
   // Queues one record of |activity| and counts its size in the day's tally. The insert's result.
   int WriteRecord(const char* activity, const char* body);
-
-  // Slice mode (on as shipped): the usage tables in eight 3-hour windows with COUNT and SUM.
-  static void SetSliceMode(bool on);
-  static bool SliceMode();
-
-  const DeviceIdentity& Identity() const { return identity; }
   // "99.02.00" until the firmware is known.
   const char* AppVersion() const;
-
- private:
   // The registry's provider of |table|; null when missing.
   BaseLogProvider* Provider(const char* table) const;
   // Null without a queue: a record then fails at its insert.

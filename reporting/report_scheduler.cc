@@ -44,6 +44,7 @@ const long kCatchUpSeconds = 259199;
 const int kOldestDayCaughtUp = 4;         // midnight this many days ago
 const long kSurveyUpdateSeconds = 43199;  // uptime before a survey update is due
 
+// Not an owning static: a pair left at exit must not be torn down after the databases.
 ReportPair* g_reportPair = nullptr;
 
 // The dates are rendered as the device's log would show them; nothing is logged, so the
@@ -84,31 +85,29 @@ void* WorkerEntry(void* data) {
 
 }  // namespace
 
+ReportPair::ReportPair() = default;
+ReportPair::~ReportPair() = default;
+
 ReportPair* ReportPair::Get(const ReportContext& context) {
   if (g_reportPair != nullptr) return g_reportPair;
   ReportPair* pair = new (std::nothrow) ReportPair();
   if (pair == nullptr) return nullptr;
   g_reportPair = pair;
-  pair->builder = new (std::nothrow) ReportBuilder(context);
+  pair->builder.reset(new (std::nothrow) ReportBuilder(context));
   if (pair->builder != nullptr && pair->uploader == nullptr) {
-    pair->uploader = new (std::nothrow) Uploader(context);
+    pair->uploader.reset(new (std::nothrow) Uploader(context));
   }
   if (pair->builder == nullptr || pair->uploader == nullptr) {
-    delete pair->builder;
-    delete pair->uploader;
-    pair->builder = nullptr;
-    pair->uploader = nullptr;
+    pair->builder.reset();
+    pair->uploader.reset();
     return nullptr;
   }
   // A failed init keeps both objects in the holder; the request still fails.
-  if (pair->uploader->Init(pair->builder) != 0) return nullptr;
+  if (pair->uploader->Init(pair->builder.get()) != 0) return nullptr;
   return pair;
 }
 
 void ReportPair::Destroy() {
-  if (g_reportPair == nullptr) return;
-  delete g_reportPair->builder;
-  delete g_reportPair->uploader;
   delete g_reportPair;
   g_reportPair = nullptr;
 }

@@ -8,6 +8,7 @@
 #include <time.h>
 
 #include <atomic>
+#include <memory>
 
 #include "reporting/report_context.h"
 
@@ -18,8 +19,11 @@ class Uploader;
 
 // The process-wide pair of the report run: one builder, one uploader.
 struct ReportPair {
-  ReportBuilder* builder = nullptr;
-  Uploader* uploader = nullptr;
+  ReportPair();
+  ~ReportPair();
+
+  std::unique_ptr<ReportBuilder> builder;
+  std::unique_ptr<Uploader> uploader;
 
   // Made on first request from |context|; a failed request still leaves the holder registered,
   // so a later request returns it as it stands (deliberately no second attempt). Null on

@@ -36,17 +36,15 @@ enum Field { kId, kTimestamp, kSvcCode, kCategory, kActivity, kLogType, kAppVers
 
 }  // namespace
 
-Uploader::~Uploader() { delete queue; }
+Uploader::Uploader(const ReportContext& context) : context(context) {}
+
+Uploader::~Uploader() = default;
 
 int Uploader::Init(ReportBuilder* reportBuilder) {
   if (reportBuilder == nullptr) return -1;
   builder = reportBuilder;
-  queue = new (std::nothrow) ServerUploadLogProvider();
+  queue.reset(new (std::nothrow) ServerUploadLogProvider());
   return queue == nullptr ? -1 : 0;
-}
-
-char** Uploader::SplitRows(char** rows, int rowCount) {
-  return RowSplitter::SplitRows(rows, rowCount, kRecordFields);
 }
 
 std::string Uploader::RankOrder() {
@@ -88,12 +86,12 @@ void Uploader::SendBatch(uint32_t limit) {
       rows.rows == nullptr) {
     return;
   }
-  char** fields = SplitRows(rows.rows, rows.count);
+  std::unique_ptr<char*[]> fields(RowSplitter::SplitRows(rows.rows, rows.count, kRecordFields));
   if (fields == nullptr) return;
   const char* appId = context.AppId();
 
   for (int i = 0; i < rows.count; ++i) {
-    char** record = fields + static_cast<size_t>(i) * kRecordFields;
+    char** record = fields.get() + static_cast<size_t>(i) * kRecordFields;
     int64_t nowMs = context.NowMs();
     time_t seconds = static_cast<time_t>(nowMs / 1000);
 
@@ -136,7 +134,6 @@ void Uploader::SendBatch(uint32_t limit) {
       (void)strftime(stamp, sizeof(stamp), "%d/%b/%Y:%H:%M:%S", &tm);
     }
   }
-  delete[] fields;
 }
 
 void Uploader::DeleteSent() {

@@ -6,6 +6,7 @@
 
 #include <stdint.h>
 
+#include <memory>
 #include <string>
 
 #include "reporting/report_builder.h"
@@ -22,7 +23,7 @@ class Uploader {
   // activity, log_type, app_version, body, rly_result.
   static constexpr int kRecordFields = 9;
 
-  explicit Uploader(const ReportContext& context) : context(context) {}
+  explicit Uploader(const ReportContext& context);
   ~Uploader();
   Uploader(const Uploader&) = delete;
   Uploader& operator=(const Uploader&) = delete;
@@ -34,8 +35,6 @@ class Uploader {
   // delete what was handed over. Runs only with a builder and runtime switch 1 on.
   void SendAll();
 
-  // The row splitter: nine field pointers per row, cut in place; null when allocation fails.
-  static char** SplitRows(char** rows, int rowCount);
   // "CASE activity WHEN '007' THEN 0 ... END " (ends in a blank: LIMIT follows directly).
   static std::string RankOrder();
 
@@ -44,7 +43,7 @@ class Uploader {
   void SendBatch(uint32_t limit);
   void DeleteSent();
 
-  ServerUploadLogProvider* queue = nullptr;
+  std::unique_ptr<ServerUploadLogProvider> queue;
   ReportBuilder* builder = nullptr;
   const ReportContext context;
 };
