@@ -16,9 +16,9 @@
 
 #include "bench/ratio_reporter.h"
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
 #include "reporting/report_builder.h"
+#include "reporting/report_context.h"
 #include "reporting/uploader.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
@@ -29,6 +29,7 @@ namespace {
 constexpr int kRowsPerTable = 5000;  // the survey tables' row limit
 int64_t g_nowMs = 0;
 int64_t BenchClock() { return g_nowMs; }
+bool ReportOn() { return true; }
 
 // This process's bytes sent to storage so far (write_bytes of /proc/self/io); 0 if unreadable.
 long long WrittenBytes() {
@@ -70,9 +71,20 @@ class Device {
     (void)prefs.Create();
     survey = DbManager::GetInstance()->GetConnection();
     upload = UploadDbManager::GetInstance()->GetConnection();
-    SetRuntimeSwitch(1, true);
     day = LocalMidnight(2024, 6, 11);
     g_nowMs = (static_cast<int64_t>(day) + 34 * 3600) * 1000;  // next day, 10:00
+  }
+  // What the daemon hands the report run, with the bench clock.
+  ReportContext Context() {
+    ReportContext context;
+    context.prefs = &prefs;
+    context.providers = ProviderRegistry::GetInstance();
+    context.survey = DbManager::GetInstance();
+    context.queue = UploadDbManager::GetInstance();
+    context.clock = BenchClock;
+    context.appId = &appId;
+    context.reportEnabled = ReportOn;
+    return context;
   }
   ~Device() {
     (void)prefs.Close();
@@ -115,6 +127,7 @@ class Device {
 
   std::string sysroot;
   PrefStore prefs;
+  const std::string appId = "com.corvane.logmanager";
   DbConnection* survey = nullptr;
   DbConnection* upload = nullptr;
   time_t day = 0;
@@ -144,9 +157,7 @@ class Floor {
  public:
   explicit Floor(Device* device) : device(device) {
     device->SeedDay();
-    ReportBuilder builder;
-    builder.SetPrefStore(&device->prefs);
-    builder.SetClock(&BenchClock);
+    ReportBuilder builder(device->Context());
     if (builder.RunDaily() != 0) abort();
     sqlite3_stmt* stmt = nullptr;
     (void)sqlite3_prepare_v2(device->upload->Handle(),
@@ -270,9 +281,7 @@ void BM_DailyRunAgainstFloor(benchmark::State& state) {
   for (auto _ : state) {
     state.PauseTiming();
     device.SeedDay();
-    ReportBuilder builder;
-    builder.SetPrefStore(&device.prefs);
-    builder.SetClock(&BenchClock);
+    ReportBuilder builder(device.Context());
     long long bytes = WrittenBytes();
     double cpu = CpuMs(), wall = WallMs();
     state.ResumeTiming();
@@ -354,10 +363,8 @@ BENCHMARK(BM_BareGroupByQueries)->Unit(benchmark::kMillisecond);
 
 void BM_SendThousandRecords(benchmark::State& state) {
   Device device;
-  ReportBuilder builder;
-  Uploader uploader;
-  uploader.SetClock(&BenchClock);
-  uploader.SetAppId("com.corvane.logmanager");
+  ReportBuilder builder(device.Context());
+  Uploader uploader(device.Context());
   (void)uploader.Init(&builder);
   std::string outbox = device.sysroot + "/opt/usr/data/log-relay/outbox.jsonl";
   for (auto _ : state) {

@@ -118,6 +118,14 @@ void WatchPowerOff() {
   }
 }
 
+// The end of a report run, on the worker: a consent withdrawn meanwhile ends the process
+// through SIGTERM, so the stop runs on the main loop.
+void RecheckConsentAfterRun(void*) {
+  int consent = -1;
+  if (vconf_get_bool(kConsentKey, &consent) < 0 || consent) return;
+  (void)kill(getpid(), SIGTERM);
+}
+
 // The daemon writes no diagnostics: EFL's own log (with its backtrace banners when a module
 // cannot reach the bus) goes nowhere, and the exit status tells how a start ended.
 void QuietLog(const Eina_Log_Domain*, Eina_Log_Level, const char*, const char*, int, const char*,
@@ -159,22 +167,14 @@ int RunDaemon() {
 
   LogManager* instance = LogManager::GetInstance();
   if (instance == nullptr) return -1;
+  if (instance->GetScheduler() != nullptr)
+    instance->GetScheduler()->SetRunEndHook(RecheckConsentAfterRun, nullptr);
   (void)ecore_idler_add(OnStartIdle, instance);
   WatchPowerOff();
   (void)ecore_event_handler_add(ECORE_EVENT_SIGNAL_EXIT, OnExitSignal, nullptr);
 
   ecore_main_loop_begin();
   ecore_shutdown();
-  return 0;
-}
-
-int RecheckConsentAfterJob() {
-  LogManager* instance = LogManager::GetInstance();
-  if (instance == nullptr || instance->GetScheduler() == nullptr) return 0;
-  if (instance->GetScheduler()->RunJob() != 0) return 0;
-  int consent = -1;
-  if (vconf_get_bool(kConsentKey, &consent) < 0 || consent) return 0;
-  (void)kill(getpid(), SIGTERM);
   return 0;
 }
 

@@ -8,6 +8,7 @@
 #include "collectors/device_status_monitor.h"
 #include "collectors/package_monitor.h"
 #include "include/provider_registry.h"
+#include "reporting/report_context.h"
 #include "reporting/report_scheduler.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
@@ -63,7 +64,14 @@ int LogManager::Construct() {
     ReleaseMonitors();  // the preference store stays
     return -1;
   }
-  return scheduler->Create() != 0 ? -1 : 0;
+  ReportContext report;
+  report.prefs = prefStore;
+  report.providers = ProviderRegistry::GetInstance();
+  report.survey = DbManager::GetInstance();
+  report.queue = UploadDbManager::GetInstance();
+  report.appId = &name;
+  report.reportEnabled = [] { return GetRuntimeSwitch(1); };
+  return scheduler->Create(report) != 0 ? -1 : 0;
 }
 
 void LogManager::ReleaseMonitors() {

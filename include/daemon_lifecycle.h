@@ -7,10 +7,6 @@ namespace _CorvaneLogManager {
 // The whole life of the daemon process. Returns 0 or -1 (exit status 0 or 255).
 int RunDaemon();
 
-// Runs when a report job ends, on the worker: the job body, then the consent check. A
-// withdrawn consent ends the process through SIGTERM, so the stop runs on the main loop.
-int RecheckConsentAfterJob();
-
 }  // namespace _CorvaneLogManager
 
 #endif  // LOGMGR_INCLUDE_DAEMON_LIFECYCLE_H_

@@ -9,28 +9,24 @@
 
 namespace _CorvaneLogManager {
 
-DeviceIdentity::~DeviceIdentity() {
-  delete[] mcc;
-  delete[] mnc;
-  free(firmware);
-  free(model);
+namespace {
+
+// 0 and |*out| set when the platform gives the text; -1 and |*out| left alone otherwise.
+int ReadSystemText(system_info_key_e key, DeviceIdentity::PlatformText* out) {
+  char* text = nullptr;
+  if (system_info_get_value_string(key, &text) != 0) return -1;
+  out->reset(text);
+  return 0;
 }
 
-int DeviceIdentity::Refresh() {
-  delete[] mcc;
-  delete[] mnc;
-  mcc = nullptr;
-  mnc = nullptr;
-  int result = ReadOperator();
+}  // namespace
 
-  if (model == nullptr) {
-    result = system_info_get_value_string(SYSTEM_INFO_KEY_MODEL, &model) == 0 ? 0 : -1;
-    if (result != 0) model = nullptr;
-  }
-  if (firmware == nullptr) {
-    result = system_info_get_value_string(SYSTEM_INFO_KEY_BUILD_STRING, &firmware) == 0 ? 0 : -1;
-    if (result != 0) firmware = nullptr;
-  }
+int DeviceIdentity::Refresh() {
+  mcc.reset();
+  mnc.reset();
+  int result = ReadOperator();
+  if (model == nullptr) result = ReadSystemText(SYSTEM_INFO_KEY_MODEL, &model);
+  if (firmware == nullptr) result = ReadSystemText(SYSTEM_INFO_KEY_BUILD_STRING, &firmware);
   return result;
 }
 
@@ -38,34 +34,27 @@ int DeviceIdentity::ReadOperator() {
   telephony_handle_list_s list;
   memset(&list, 0, sizeof(list));
   if (telephony_init(&list) != 0) return -1;
-  char* op = nullptr;
-  if (list.count == 0 || telephony_sim_get_operator(list.handle[0], &op) != 0 || op == nullptr) {
-    free(op);
-    (void)telephony_deinit(&list);
-    return -1;
-  }
-  size_t len = strlen(op);
-  if (len != 5 && len != 6) {
-    free(op);
+  char* text = nullptr;
+  int err = list.count == 0 ? -1 : telephony_sim_get_operator(list.handle[0], &text);
+  PlatformText op(text);
+  size_t len = op != nullptr ? strlen(op.get()) : 0;
+  if (err != 0 || (len != 5 && len != 6)) {
     (void)telephony_deinit(&list);
     return -1;
   }
   size_t mncLen = len - 3;
-  mcc = new (std::nothrow) char[4];
-  mnc = new (std::nothrow) char[mncLen + 1];
+  mcc.reset(new (std::nothrow) char[4]);
+  mnc.reset(new (std::nothrow) char[mncLen + 1]);
   if (mcc != nullptr && mnc != nullptr) {
-    memcpy(mcc, op, 3);
+    memcpy(mcc.get(), op.get(), 3);
     mcc[3] = '\0';
-    memcpy(mnc, op + 3, mncLen);
+    memcpy(mnc.get(), op.get() + 3, mncLen);
     mnc[mncLen] = '\0';
   } else {
     // The codes are then simply unknown; the read itself counts as done.
-    delete[] mcc;
-    delete[] mnc;
-    mcc = nullptr;
-    mnc = nullptr;
+    mcc.reset();
+    mnc.reset();
   }
-  free(op);
   (void)telephony_deinit(&list);
   return 0;
 }

@@ -2,12 +2,16 @@
 #ifndef LOGMGR_REPORTING_DEVICE_IDENTITY_H_
 #define LOGMGR_REPORTING_DEVICE_IDENTITY_H_
 
+#include <stdlib.h>
+
+#include <memory>
+
 namespace _CorvaneLogManager {
 
 class DeviceIdentity {
  public:
   DeviceIdentity() = default;
-  ~DeviceIdentity();
+  ~DeviceIdentity() = default;
   DeviceIdentity(const DeviceIdentity&) = delete;
   DeviceIdentity& operator=(const DeviceIdentity&) = delete;
 
@@ -16,18 +20,24 @@ class DeviceIdentity {
   int Refresh();
 
   // Null while unknown.
-  const char* Mcc() const { return mcc; }
-  const char* Mnc() const { return mnc; }
-  const char* Model() const { return model; }
-  const char* Firmware() const { return firmware; }
+  const char* Mcc() const { return mcc.get(); }
+  const char* Mnc() const { return mnc.get(); }
+  const char* Model() const { return model.get(); }
+  const char* Firmware() const { return firmware.get(); }
+
+  // A text the platform allocated, released with free().
+  struct FreeText {
+    void operator()(char* text) const { free(text); }
+  };
+  using PlatformText = std::unique_ptr<char, FreeText>;
 
  private:
   int ReadOperator();
 
-  char* mcc = nullptr;       // 3 characters, new[]
-  char* mnc = nullptr;       // 2 or 3 characters, new[]
-  char* firmware = nullptr;  // from the platform, free()
-  char* model = nullptr;     // from the platform, free()
+  std::unique_ptr<char[]> mcc;  // 3 characters
+  std::unique_ptr<char[]> mnc;  // 2 or 3 characters
+  PlatformText firmware;
+  PlatformText model;
 };
 
 }  // namespace _CorvaneLogManager

@@ -4,14 +4,13 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
-#include <sys/time.h>
 
 #include <initializer_list>
+#include <memory>
 
 #include "base/clock.h"
 #include "include/base_log_provider.h"
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
 #include "include/sql_literal.h"
 #include "reporting/row_splitter.h"
@@ -20,23 +19,31 @@
 
 namespace _CorvaneLogManager {
 
+// How a grouped table is selected in one mode.
+struct Grouping {
+  const char* aggregate;  // appended to the columns: COUNT, in slice mode maybe SUM
+  const char* groupBy;
+  const char* sumText;  // the records' "sum=" value
+};
+
+// How a table is cut into windows in slice mode.
+struct Slicing {
+  int windows;  // 0: never sliced, one whole-day window in either mode
+  int windowHours;
+  bool sumReplacesLastKey;  // a SUM column ends the row and stands for the last key's value
+  Grouping grouping;
+};
+
 // How one collection table becomes records. Columns after timestamp give the pair keys; a
-// grouped table adds COUNT (and in slice mode maybe SUM, which replaces the last column).
+// grouped table adds COUNT (and in slice mode maybe SUM).
 struct Aggregation {
   const char* table;
   const char* activity;
   const char* columns;
   const char* keys[5];  // pair keys of the columns after timestamp, null-terminated
-  bool grouped;         // false: one record per row, no sum/count pairs, always mode 0
-  const char* sliceAggregate;
-  const char* sliceGroup;
-  const char* sliceSum;
-  int sliceWindows;
-  int sliceHours;
-  bool sliceSumsLast;
-  const char* plainAggregate;
-  const char* plainGroup;
-  const char* plainSum;
+  bool grouped;         // false: one record per row, no sum/count pairs, always a whole day
+  Slicing slice;
+  Grouping plain;
 };
 
 namespace {
@@ -45,13 +52,18 @@ constexpr char kDateFormat[] = "%Y-%m-%dT%H:%M:%S%z";
 constexpr char kSeparator[] = "\xC2\xB6";  // "¶"
 constexpr char kRecordColumns[] = "svc_code,category_code,activity,log_type,app_version,body";
 constexpr char kDefaultVersion[] = "99.02.00";
+// The record's fixed codes, as the relay's receiver expects them.
+constexpr char kServiceCode[] = "701";
+constexpr char kCategoryCode[] = "999";
+constexpr char kLogType[] = "BIZ";
 // The queue provider's insert statement is 1024 bytes; the values text gets what its fixed
 // parts leave, the timestamp counted at its widest, so the statement is never cut.
 constexpr size_t kInsertStatementSize = 1024;
 constexpr size_t kValuesSize = kInsertStatementSize - (sizeof("INSERT INTO survey_log(") - 1) -
                                (sizeof(kRecordColumns) - 1) - (sizeof(",timestamp) VALUES (") - 1) -
                                (sizeof(",-9223372036854775808);") - 1);
-constexpr int kTallyExtra = 30;
+constexpr int kTallyExtra = 30;  // per record, on top of its body's length
+constexpr char kQueueTable[] = "server_upload";
 
 // The slice sums. SUM fails the whole select once two values overflow 64 bits, which would
 // cost the window's other records and block the day; TOTAL never fails. An all-integer group
@@ -63,25 +75,42 @@ constexpr int kTallyExtra = 30;
   "CASE WHEN COUNT(" col ")=0 THEN NULL WHEN MAX(typeof(" col ") NOT IN ('integer','null')) " \
   "THEN TOTAL(" col ") ELSE CAST(TOTAL(" col ") AS INTEGER) END"
 
+constexpr char kCount[] = " , COUNT(1)";
+// Outside slice mode a grouped table counts the rows of each timestamp.
+constexpr Grouping kPerTimestamp = {kCount, "timestamp", "0"};
+constexpr Grouping kUngrouped = {"", nullptr, ""};
+constexpr Slicing kNeverSliced = {0, 0, false, kUngrouped};
+constexpr bool kGrouped = true;
+constexpr bool kRecordPerRow = false;
+
+// Eight 3-hour windows whose SUM column (the last) stands for the last key's value.
+constexpr Slicing ThreeHourSums(Grouping grouping) { return {8, 3, true, grouping}; }
+// The whole day as one 24-hour window, counted only.
+constexpr Slicing OneDayCount(Grouping grouping) { return {1, 24, false, grouping}; }
+
 // In the order the day is processed.
 const Aggregation kAggregations[] = {
-    {"use_app_survey", "001", "timestamp,app_id,duration", {"app_id", "duration", nullptr}, true,
-     " , COUNT(1), " LOGMGR_CLAMPED_SUM("duration"), "app_id", "3", 8, 3, true, " , COUNT(1)",
-     "timestamp", "0"},
-    {"manage_app_survey", "003", "timestamp,installed_app_id,type", {"app_id", "type", nullptr},
-     false, "", nullptr, "", 0, 0, false, "", nullptr, ""},
-    {"report_app_error_survey", "004", "timestamp,app_id,type", {"app_id", "type", nullptr}, true,
-     " , COUNT(1)", "app_id,type", "24", 1, 24, false, " , COUNT(1)", "timestamp", "0"},
-    {"use_app_feature_survey", "002", "timestamp,app_id,feature,extra,value",
-     {"app_id", "feature", "extra", "value", nullptr}, true,
-     " , COUNT(1), " LOGMGR_CLAMPED_SUM("value"), "app_id,feature,extra", "3", 8, 3, true,
-     " , COUNT(1)", "timestamp", "0"},
+    {"use_app_survey", kActivityUseApp, "timestamp,app_id,duration",
+     {"app_id", "duration", nullptr}, kGrouped,
+     ThreeHourSums({" , COUNT(1), " LOGMGR_CLAMPED_SUM("duration"), "app_id", "3"}),
+     kPerTimestamp},
+    {"manage_app_survey", kActivityManage, "timestamp,installed_app_id,type",
+     {"app_id", "type", nullptr}, kRecordPerRow, kNeverSliced, kUngrouped},
+    {"report_app_error_survey", kActivityError, "timestamp,app_id,type",
+     {"app_id", "type", nullptr}, kGrouped,
+     OneDayCount({kCount, "app_id,type", "24"}),
+     kPerTimestamp},
+    {"use_app_feature_survey", kActivityFeature, "timestamp,app_id,feature,extra,value",
+     {"app_id", "feature", "extra", "value", nullptr}, kGrouped,
+     ThreeHourSums({" , COUNT(1), " LOGMGR_CLAMPED_SUM("value"), "app_id,feature,extra", "3"}),
+     kPerTimestamp},
 };
 // clang-format on
 
 #undef LOGMGR_CLAMPED_SUM
 
-bool g_sliceMode = true;
+// Slice mode, on as shipped: the usage tables in eight 3-hour windows with COUNT and SUM.
+constexpr bool kSliceMode = true;
 
 // 0 when the time cannot be rendered.
 size_t RenderDate(time_t seconds, char* out, size_t size) {
@@ -122,64 +151,31 @@ void AppendTexts(char* buf, size_t size, size_t* len, std::initializer_list<cons
   }
 }
 
-void FreeRows(char** rows, int rowCount) {
-  if (rows == nullptr) return;
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
-}
-
-// A select's rows, freed when they go out of scope: also when a stop ends the worker inside one
-// of their records' inserts, as the thread's unwinding runs this (memory only, no statement).
-struct SelectedRows {
-  SelectedRows() = default;
-  SelectedRows(const SelectedRows&) = delete;
-  SelectedRows& operator=(const SelectedRows&) = delete;
-  ~SelectedRows() { FreeRows(rows, count); }
-  char** rows = nullptr;
-  int count = 0;
-};
-
 }  // namespace
 
-int64_t SystemClockMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<int64_t>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
+BaseLogProvider* ReportBuilder::Provider(const char* table) const {
+  return context.providers != nullptr ? context.providers->Lookup(table) : nullptr;
 }
 
-void ReportBuilder::SetSliceMode(bool on) { g_sliceMode = on; }
-bool ReportBuilder::SliceMode() { return g_sliceMode; }
-
-PrefStore* ReportBuilder::Prefs() const {
-  if (prefStore != nullptr) return prefStore;
-  LogManager* manager = LogManager::GetInstance();
-  return manager != nullptr ? manager->GetPrefStore() : nullptr;
+DbConnection* ReportBuilder::QueueConnection() const {
+  return context.queue != nullptr ? context.queue->GetConnection() : nullptr;
 }
 
 const char* ReportBuilder::AppVersion() const {
   return identity.Firmware() != nullptr ? identity.Firmware() : kDefaultVersion;
 }
 
-namespace {
-
-DbConnection* QueueConnection() {
-  UploadDbManager* manager = UploadDbManager::GetInstance();
-  return manager != nullptr ? manager->GetConnection() : nullptr;
-}
-
-}  // namespace
-
 int ReportBuilder::RunDaily() {
-  if (!GetRuntimeSwitch(1)) return -1;
+  if (!context.ReportEnabled()) return -1;
   // A worker stopped inside a table's transaction leaves it open; its records were never
   // committed and that table's rows are still there, so dropping them loses nothing.
   DbConnection* queueConn = QueueConnection();
   if (queueConn != nullptr && queueConn->RollBackOpenTransaction() != 0) return -1;
   (void)identity.Refresh();
   headReady = false;  // the identity may have changed
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return -1;
-  time_t now = static_cast<time_t>((clockFn != nullptr ? clockFn() : SystemClockMs()) / 1000);
+  time_t now = context.NowSeconds();
   time_t limit = LocalMidnightDaysBefore(now, 1);
   time_t day = static_cast<time_t>(prefs->NormaliseSentDate());
   if (day == 0) return -1;
@@ -194,7 +190,10 @@ int ReportBuilder::RunDaily() {
     (void)RenderDate(day, dayText, sizeof(dayText));
 
     sizeTally.clear();
-    for (const char* activity : {"001", "002", "003", "004"}) sizeTally[activity] = 0;
+    for (const char* activity :
+         {kActivityUseApp, kActivityFeature, kActivityManage, kActivityError}) {
+      sizeTally[activity] = 0;
+    }
     for (const Aggregation& agg : kAggregations) {
       if (Aggregate(agg, day) != 0) return -1;
     }
@@ -210,7 +209,7 @@ void ReportBuilder::ComputeWindow(time_t day, int mode, int offsetHours, int len
   long long end = 0;
   if (localtime_r(&day, &tm) != nullptr) {
     tm.tm_isdst = -1;
-    if (mode == 0) {
+    if (mode == kWholeDay) {
       start = static_cast<long long>(day) * 1000;
       tm.tm_hour += 23;
       tm.tm_min += 59;
@@ -243,33 +242,32 @@ int ReportBuilder::Aggregate(const Aggregation& agg, time_t day) {
 }
 
 int ReportBuilder::AggregateWindows(const Aggregation& agg, time_t day) {
-  bool slice = g_sliceMode && agg.sliceWindows > 0;
+  bool slice = kSliceMode && agg.slice.windows > 0;
+  const Grouping& grouping = slice ? agg.slice.grouping : agg.plain;
   char columns[320];
-  snprintf(columns, sizeof(columns), "%s%s", agg.columns,
-           slice ? agg.sliceAggregate : agg.plainAggregate);
-  const char* group = slice ? agg.sliceGroup : agg.plainGroup;
-  const char* sumText = slice ? agg.sliceSum : agg.plainSum;
-  int windows = slice ? agg.sliceWindows : 1;
+  snprintf(columns, sizeof(columns), "%s%s", agg.columns, grouping.aggregate);
+  int windows = slice ? agg.slice.windows : 1;
 
   for (int w = 0; w < windows; ++w) {
     if (slice) {
-      ComputeWindow(day, 2, w * agg.sliceHours, agg.sliceHours);
+      ComputeWindow(day, kHourWindow, w * agg.slice.windowHours, agg.slice.windowHours);
     } else {
-      ComputeWindow(day, 0, 0, 0);
+      ComputeWindow(day, kWholeDay, 0, 0);
     }
     char where[256];
     snprintf(where, sizeof(where), "timestamp >= %s and timestamp < %s", windowStart, windowEnd);
-    BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(agg.table);
+    BaseLogProvider* provider = Provider(agg.table);
     if (provider == nullptr) return -1;
-    SelectedRows selected;
+    // Freed also when a stop ends the worker inside one of their records' inserts.
+    QueryRows selected;
     int rc = agg.grouped
-                 ? provider->SelectGroupedRows(columns, where, nullptr, group, &selected.count,
-                                               &selected.rows)
+                 ? provider->SelectGroupedRows(columns, where, nullptr, grouping.groupBy,
+                                               &selected.count, &selected.rows)
                  : provider->SelectRows(columns, where, nullptr, &selected.count, &selected.rows);
     if (rc != 0) return -1;
     int result = 0;
     for (int i = 0; i < selected.count && result == 0 && selected.rows != nullptr; ++i) {
-      result = WriteRow(agg, slice, sumText, selected.rows[i]);
+      result = WriteRow(agg, slice, grouping.sumText, selected.rows[i]);
     }
     if (result != 0) return -1;
   }
@@ -280,16 +278,15 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
                             char* rowText) {
   int keyCount = 0;
   while (agg.keys[keyCount] != nullptr) ++keyCount;
-  bool hasSum = slice && agg.sliceSumsLast;
+  bool hasSum = slice && agg.slice.sumReplacesLastKey;
   int fieldCount = 1 + keyCount + (agg.grouped ? 1 : 0) + (hasSum ? 1 : 0);
-  char** fields = RowSplitter::SplitRows(&rowText, 1, fieldCount);
+  std::unique_ptr<char*[]> fields(RowSplitter::SplitRows(&rowText, 1, fieldCount));
   if (fields == nullptr) return -1;
 
   // An aggregated group has no single time of its own: slice records carry the window end.
   long long stamp = slice ? strtoll(windowEnd, nullptr, 10) : strtoll(fields[0], nullptr, 10);
   char date[kDateSize];
   if (RenderDate(static_cast<time_t>(stamp / 1000), date, sizeof(date)) == 0) {
-    delete[] fields;
     return 0;  // skipped silently
   }
 
@@ -304,7 +301,6 @@ int ReportBuilder::WriteRow(const Aggregation& agg, bool slice, const char* sumT
     bool first = !agg.grouped && k == 0;
     AppendTexts(body, sizeof(body), &len, {first ? "" : kSeparator, agg.keys[k], "=", value});
   }
-  delete[] fields;
   return WriteRecord(agg.activity, body);
 }
 
@@ -335,15 +331,17 @@ size_t ReportBuilder::BeginBody(char* body, size_t size, const char* date) {
 int ReportBuilder::WriteSummary(const char* renderedDay) {
   char body[kBodySize];
   size_t len = BeginBody(body, sizeof(body), renderedDay);
-  AppendF(body, sizeof(body), &len, "size_001=%d%ssize_002=%d%ssize_003=%d%ssize_004=%d",
-          sizeTally["001"], kSeparator, sizeTally["002"], kSeparator, sizeTally["003"], kSeparator,
-          sizeTally["004"]);
-  return WriteRecord("007", body);
+  AppendF(body, sizeof(body), &len, "size_%s=%d%ssize_%s=%d%ssize_%s=%d%ssize_%s=%d",
+          kActivityUseApp, sizeTally[kActivityUseApp], kSeparator, kActivityFeature,
+          sizeTally[kActivityFeature], kSeparator, kActivityManage, sizeTally[kActivityManage],
+          kSeparator, kActivityError, sizeTally[kActivityError]);
+  return WriteRecord(kActivitySummary, body);
 }
 
 int ReportBuilder::WriteRecord(const char* activity, const char* body) {
   char values[kValuesSize];
-  snprintf(values, sizeof(values), "'701','999','%s','BIZ','", activity);
+  snprintf(values, sizeof(values), "'%s','%s','%s','%s','", kServiceCode, kCategoryCode, activity,
+           kLogType);
   PrepareHead();
   (void)AppendQuoted(values, sizeof(values), recordVersion.c_str());
   size_t used = strlen(values);
@@ -366,13 +364,13 @@ int ReportBuilder::WriteRecord(const char* activity, const char* body) {
   // The summary counts what the day produced, stored or not.
   sizeTally[activity] += static_cast<int32_t>(strlen(body)) + kTallyExtra;
 
-  BaseLogProvider* queue = ProviderRegistry::GetInstance()->Lookup("server_upload");
+  BaseLogProvider* queue = Provider(kQueueTable);
   if (queue == nullptr) return -1;
   return queue->InsertRow(kRecordColumns, values);
 }
 
 int ReportBuilder::PurgeTable(const char* table, const char* bound) {
-  BaseLogProvider* provider = ProviderRegistry::GetInstance()->Lookup(table);
+  BaseLogProvider* provider = Provider(table);
   if (provider == nullptr) return -1;
   char where[256];
   snprintf(where, sizeof(where), "timestamp < %s", bound);

@@ -28,54 +28,58 @@
 #include <string>
 
 #include "reporting/device_identity.h"
+#include "reporting/report_context.h"
 
 namespace _CorvaneLogManager {
 
+// Record activity codes: one per collection table, and the day's size summary.
+inline constexpr char kActivityUseApp[] = "001";
+inline constexpr char kActivityFeature[] = "002";
+inline constexpr char kActivityManage[] = "003";
+inline constexpr char kActivityError[] = "004";
+inline constexpr char kActivitySummary[] = "007";
+
+class BaseLogProvider;
+class DbConnection;
 class PrefStore;
 struct Aggregation;
-
-// Milliseconds since the epoch; injectable so day boundaries can be tested.
-typedef int64_t (*ReportClock)();
-int64_t SystemClockMs();
 
 class ReportBuilder {
  public:
   static constexpr size_t kBodySize = 4096;
   static constexpr size_t kDateSize = 80;
+  // ComputeWindow's modes.
+  static constexpr int kWholeDay = 0;
+  static constexpr int kHourWindow = 2;
 
-  ReportBuilder() = default;
+  explicit ReportBuilder(const ReportContext& context) : context(context) {}
   ~ReportBuilder() = default;
+  ReportBuilder(const ReportBuilder&) = delete;
+  ReportBuilder& operator=(const ReportBuilder&) = delete;
 
   // Aggregates every day after key_sent_date up to yesterday, oldest first, advancing the
   // sent date after each. 0 when all due days were done; -1 otherwise (the failed day is
   // repeated by the next run; its records already queued stay, so it may queue them twice).
   int RunDaily();
 
-  // Window of day start |day| (local midnight, seconds): mode 0 is the whole day up to
-  // 23:59:59 (the last second deliberately outside); mode 2 is |lengthHours| from
-  // |offsetHours|. Sets the window texts (ms).
+  // Window of day start |day| (local midnight, seconds): kWholeDay is the day up to 23:59:59
+  // (the last second deliberately outside); kHourWindow is |lengthHours| from |offsetHours|.
+  // Sets the window texts (ms).
   void ComputeWindow(time_t day, int mode, int offsetHours, int lengthHours);
   const char* WindowStart() const { return windowStart; }
   const char* WindowEnd() const { return windowEnd; }
 
+ private:
   // Deletes rows of the provider |table| with timestamp < |bound|. 0 / -1.
   int PurgeTable(const char* table, const char* bound);
   // Queues one record of |activity| and counts its size in the day's tally. The insert's result.
   int WriteRecord(const char* activity, const char* body);
-
-  // Slice mode (on as shipped): the usage tables in eight 3-hour windows with COUNT and SUM.
-  static void SetSliceMode(bool on);
-  static bool SliceMode();
-
-  // Defaults: LogManager's store and the system clock.
-  void SetPrefStore(PrefStore* store) { prefStore = store; }
-  void SetClock(ReportClock clock) { clockFn = clock; }
-  const DeviceIdentity& Identity() const { return identity; }
   // "99.02.00" until the firmware is known.
   const char* AppVersion() const;
-
- private:
-  PrefStore* Prefs() const;
+  // The registry's provider of |table|; null when missing.
+  BaseLogProvider* Provider(const char* table) const;
+  // Null without a queue: a record then fails at its insert.
+  DbConnection* QueueConnection() const;
   // One table's day: its records in one queue transaction, then the purge of its rows.
   int Aggregate(const Aggregation& agg, time_t day);
   int AggregateWindows(const Aggregation& agg, time_t day);
@@ -91,8 +95,7 @@ class ReportBuilder {
   char windowEnd[24] = "";
   std::map<std::string, int32_t> sizeTally;
   DeviceIdentity identity;
-  PrefStore* prefStore = nullptr;
-  ReportClock clockFn = nullptr;
+  const ReportContext context;
   std::string bodyHead;
   std::string recordVersion;
   bool headReady = false;

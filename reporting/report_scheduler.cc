@@ -6,16 +6,13 @@
 #include <stdlib.h>
 #include <string.h>
 #include <sys/sysinfo.h>
-#include <sys/time.h>
 #include <vconf.h>
 
 #include <new>
 
 #include "base/clock.h"
 #include "include/base_log_provider.h"
-#include "include/daemon_lifecycle.h"
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
 #include "reporting/report_builder.h"
 #include "reporting/row_splitter.h"
@@ -30,28 +27,25 @@ namespace {
 const char kTimeChangedKey[] = "memory/system/timechanged";
 const char kDumpKey[] = "db/corvane-log-manager/dumpcontext";
 const char kMmcKey[] = "memory/appservice/mmc";
-const int kAlarmInterval = 7200;
-const int kFirstAlarmDelay = 180;
-const long long kWeekMs = 604799999LL;
-const long kWeekSeconds = 604800;
+const char kStatusTable[] = "report_app_status_survey";
+const char kFeatureTable[] = "use_app_feature_survey";
+const char kSdCardFeature[] = "SDCA";
+const int kSdCardPresent = 1000;
+const int kAlarmInterval = 7200;   // seconds between due checks
+const int kFirstAlarmDelay = 180;  // seconds from start to the first alarm
+// The one-shot timer's delay: a random second within this span after the minimum.
+const int kRandomDelayMin = 3600;
+const int kRandomDelaySpan = 7200;
+const long long kPurgeIntervalMs = 604799999LL;  // a week less a millisecond
+const long kStatusCopyIntervalSeconds = 604800;  // a week
+// After a time change a sent date more than three days behind yesterday gives up the days
+// before the oldest one caught up.
+const long kCatchUpSeconds = 259199;
+const int kOldestDayCaughtUp = 4;         // midnight this many days ago
+const long kSurveyUpdateSeconds = 43199;  // uptime before a survey update is due
 
+// Not an owning static: a pair left at exit must not be torn down after the databases.
 ReportPair* g_reportPair = nullptr;
-
-long long NowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
-
-ReportScheduler* CurrentScheduler() {
-  LogManager* manager = LogManager::GetInstance();
-  return manager != nullptr ? manager->GetScheduler() : nullptr;
-}
-
-PrefStore* Prefs() {
-  LogManager* manager = LogManager::GetInstance();
-  return manager != nullptr ? manager->GetPrefStore() : nullptr;
-}
 
 // The dates are rendered as the device's log would show them; nothing is logged, so the
 // texts go nowhere.
@@ -62,20 +56,20 @@ void RenderDate(time_t when) {
     (void)strftime(text, sizeof text, "%Y-%m-%dT%H:%M:%S%z", &tm);
 }
 
-int OnAlarm(alarm_id_t id, void*) {
-  ReportScheduler* scheduler = CurrentScheduler();
+int OnAlarm(alarm_id_t id, void* data) {
+  auto* scheduler = static_cast<ReportScheduler*>(data);
   if (scheduler == nullptr || id != scheduler->AlarmId()) return 0;
   scheduler->HandleEvent(ReportScheduler::kAlarm);
   return 0;
 }
 
-void OnDumpRequest(keynode_t*, void*) {
-  ReportScheduler* scheduler = CurrentScheduler();
+void OnDumpRequest(keynode_t*, void* data) {
+  auto* scheduler = static_cast<ReportScheduler*>(data);
   if (scheduler != nullptr) scheduler->HandleEvent(ReportScheduler::kDumpContext);
 }
 
-void OnTimeChanged(keynode_t*, void*) {
-  ReportScheduler* scheduler = CurrentScheduler();
+void OnTimeChanged(keynode_t*, void* data) {
+  auto* scheduler = static_cast<ReportScheduler*>(data);
   if (scheduler != nullptr) scheduler->HandleEvent(ReportScheduler::kTimeChanged);
 }
 
@@ -84,53 +78,52 @@ Eina_Bool OnRandomTimer(void* data) {
   return ECORE_CALLBACK_CANCEL;
 }
 
-void* WorkerEntry(void*) {
-  (void)RecheckConsentAfterJob();
+void* WorkerEntry(void* data) {
+  static_cast<ReportScheduler*>(data)->RunAndEnd();
   return nullptr;
 }
 
 }  // namespace
 
-ReportPair* ReportPair::Get() {
+ReportPair::ReportPair() = default;
+ReportPair::~ReportPair() = default;
+
+ReportPair* ReportPair::Get(const ReportContext& context) {
   if (g_reportPair != nullptr) return g_reportPair;
   ReportPair* pair = new (std::nothrow) ReportPair();
   if (pair == nullptr) return nullptr;
   g_reportPair = pair;
-  pair->builder = new (std::nothrow) ReportBuilder();
+  pair->builder.reset(new (std::nothrow) ReportBuilder(context));
   if (pair->builder != nullptr && pair->uploader == nullptr) {
-    pair->uploader = new (std::nothrow) Uploader();
+    pair->uploader.reset(new (std::nothrow) Uploader(context));
   }
   if (pair->builder == nullptr || pair->uploader == nullptr) {
-    delete pair->builder;
-    delete pair->uploader;
-    pair->builder = nullptr;
-    pair->uploader = nullptr;
+    pair->builder.reset();
+    pair->uploader.reset();
     return nullptr;
   }
   // A failed init keeps both objects in the holder; the request still fails.
-  if (pair->uploader->Init(pair->builder) != 0) return nullptr;
+  if (pair->uploader->Init(pair->builder.get()) != 0) return nullptr;
   return pair;
 }
 
 void ReportPair::Destroy() {
-  if (g_reportPair == nullptr) return;
-  delete g_reportPair->builder;
-  delete g_reportPair->uploader;
   delete g_reportPair;
   g_reportPair = nullptr;
 }
 
-time_t ReportScheduler::MidnightDaysAgo(int days) {
-  return LocalMidnightDaysBefore(time(nullptr), days);
+time_t ReportScheduler::MidnightDaysAgo(int days) const {
+  return LocalMidnightDaysBefore(context.NowSeconds(), days);
 }
 
-int ReportScheduler::Create() {
+int ReportScheduler::Create(const ReportContext& reportContext) {
+  context = reportContext;
   alarmEntry = nullptr;
   alarmId = 0;
   running = false;
   worker = 0;
   workerStarted = false;
-  reportPair = ReportPair::Get();
+  reportPair = ReportPair::Get(context);
   return reportPair != nullptr ? 0 : -1;
 }
 
@@ -146,7 +139,7 @@ void ReportScheduler::CreateAlarm(int interval) {
   alarmEntry = alarmmgr_create_alarm();
   bool ok = alarmEntry != nullptr && alarmmgr_set_cb(OnAlarm, this) == 0;
   if (ok) {
-    time_t start = time(nullptr) + kFirstAlarmDelay;
+    time_t start = context.NowSeconds() + kFirstAlarmDelay;
     struct tm tm;
     ok = localtime_r(&start, &tm) != nullptr;
     alarm_date_t date = {tm.tm_year + 1900, tm.tm_mon + 1, tm.tm_mday,
@@ -167,10 +160,10 @@ void ReportScheduler::CreateAlarm(int interval) {
 }
 
 void ReportScheduler::RegisterWatches() {
-  (void)vconf_notify_key_changed(kTimeChangedKey, OnTimeChanged, nullptr);
+  (void)vconf_notify_key_changed(kTimeChangedKey, OnTimeChanged, this);
   int dump = 0;
   if (vconf_get_bool(kDumpKey, &dump) == -1) (void)vconf_set_bool(kDumpKey, 0);
-  (void)vconf_notify_key_changed(kDumpKey, OnDumpRequest, nullptr);
+  (void)vconf_notify_key_changed(kDumpKey, OnDumpRequest, this);
 }
 
 void ReportScheduler::Stop() {
@@ -184,12 +177,11 @@ void ReportScheduler::Stop() {
   if (running.load() && workerStarted && pthread_cancel(worker) == 0) {
     // The worker may sit inside a statement with cancellation off: interrupting both
     // connections makes that statement fail, and the worker ends itself there.
-    UploadDbManager* upload = UploadDbManager::GetInstance();
-    if (upload != nullptr && upload->GetConnection() != nullptr)
-      upload->GetConnection()->Interrupt();
-    DbManager* survey = DbManager::GetInstance();
-    if (survey != nullptr && survey->GetConnection() != nullptr)
-      survey->GetConnection()->Interrupt();
+    for (DatabaseOwner* owner : {static_cast<DatabaseOwner*>(context.queue),
+                                 static_cast<DatabaseOwner*>(context.survey)}) {
+      if (owner != nullptr && owner->GetConnection() != nullptr)
+        owner->GetConnection()->Interrupt();
+    }
   }
   // Also a finished worker: it may still be re-checking consent, and the pair, the
   // connections and LogManager go away right after this.
@@ -220,26 +212,26 @@ void ReportScheduler::HandleEvent(int kind) {
 }
 
 int ReportScheduler::ClampSentDate(bool forced) {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return -1;
   long long sent = prefs->GetSentDate();
-  time_t now = time(nullptr);
+  time_t now = context.NowSeconds();
   struct tm tm;
   if (localtime_r(&now, &tm) == nullptr) return -1;
   if (sent == 0) return prefs->SetSentDate(static_cast<int32_t>(MidnightDaysAgo(1)));
+  time_t oldest = MidnightDaysAgo(kOldestDayCaughtUp);
   if (!forced) {
-    time_t m4 = MidnightDaysAgo(4);
-    if (sent < m4) return prefs->SetSentDate(static_cast<int32_t>(m4));
+    if (sent < oldest) return prefs->SetSentDate(static_cast<int32_t>(oldest));
     return 0;
   }
-  time_t m1 = MidnightDaysAgo(1);
-  if (sent > m1) return prefs->SetSentDate(static_cast<int32_t>(m1));
-  if (m1 - sent > 259199) return prefs->SetSentDate(static_cast<int32_t>(MidnightDaysAgo(4)));
+  time_t yesterday = MidnightDaysAgo(1);
+  if (sent > yesterday) return prefs->SetSentDate(static_cast<int32_t>(yesterday));
+  if (yesterday - sent > kCatchUpSeconds) return prefs->SetSentDate(static_cast<int32_t>(oldest));
   return 0;
 }
 
 void ReportScheduler::CheckReportDue() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return;
   long long sent = prefs->GetSentDate();
   RenderDate(static_cast<time_t>(sent));
@@ -263,9 +255,13 @@ void ReportScheduler::JoinFinishedWorker() {
   workerStarted = false;
 }
 
+void ReportScheduler::RunAndEnd() {
+  if (RunJob() == 0 && runEndHook != nullptr) runEndHook(runEndData);
+}
+
 int ReportScheduler::RunJob() {
   if (reportPair == nullptr) return -1;
-  if (GetRuntimeSwitch(1) && reportPair->builder != nullptr &&
+  if (context.ReportEnabled() && reportPair->builder != nullptr &&
       reportPair->builder->RunDaily() == 0 && reportPair->uploader != nullptr) {
     reportPair->uploader->SendAll();
   }
@@ -275,24 +271,23 @@ int ReportScheduler::RunJob() {
 }
 
 void ReportScheduler::CheckWeeklyPurge() {
-  PrefStore* prefs = Prefs();
-  long long now = NowMs();
+  PrefStore* prefs = context.prefs;
+  long long now = context.NowMs();
   long long stored = prefs != nullptr ? prefs->GetDeleteDate() : -1;
-  if (stored != -1 && now - stored <= kWeekMs) return;
-  DbManager* survey = DbManager::GetInstance();
-  if (survey == nullptr) return;
-  (void)survey->NotifyDeleteExpired();
+  if (stored != -1 && now - stored <= kPurgeIntervalMs) return;
+  if (context.survey == nullptr) return;
+  (void)context.survey->NotifyDeleteExpired();
   if (prefs != nullptr) (void)prefs->SetDeleteDate(now);
 }
 
 void ReportScheduler::ResetAfterTimeChange() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs != nullptr) (void)prefs->SetDeleteDate(0);  // the next run purges
   (void)ClampSentDate(true);
 }
 
 void ReportScheduler::DumpContext() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return;
   (void)prefs->SetDeleteDate(0);
   int days = 0;
@@ -305,9 +300,9 @@ void ReportScheduler::DumpContext() {
 }
 
 void ReportScheduler::CheckWeeklyStatusCopy() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   if (prefs == nullptr) return;
-  time_t now = time(nullptr);
+  time_t now = context.NowSeconds();
   struct tm tm;
   if (localtime_r(&now, &tm) == nullptr) return;
   long t = static_cast<long>(mktime(&tm));
@@ -316,31 +311,30 @@ void ReportScheduler::CheckWeeklyStatusCopy() {
     (void)prefs->SetReportDate(static_cast<int32_t>(t));
     return;
   }
-  if (r != 0 && t - r < kWeekSeconds) return;
+  if (r != 0 && t - r < kStatusCopyIntervalSeconds) return;
   CopyStatusSnapshot(r);
   AddSdCardRow();
   (void)prefs->SetReportDate(static_cast<int32_t>(t));
 }
 
 void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
+  ProviderRegistry* registry = context.providers;
   if (registry == nullptr) return;
-  BaseLogProvider* status = registry->Lookup("report_app_status_survey");
-  BaseLogProvider* feature = registry->Lookup("use_app_feature_survey");
+  BaseLogProvider* status = registry->Lookup(kStatusTable);
+  BaseLogProvider* feature = registry->Lookup(kFeatureTable);
   if (status == nullptr || feature == nullptr) return;
 
   // Seconds compared with millisecond timestamps: every row qualifies. Kept as it is.
   char where[512];
   (void)snprintf(where, sizeof where, "timestamp>%ld", lowerBound);
-  int rowCount = 0;
-  char** rows = nullptr;
-  if (status->SelectGroupedRows("app_id,feature,extra,value", where, nullptr, nullptr, &rowCount,
-                                &rows) != 0) {
+  QueryRows rows;
+  if (status->SelectGroupedRows("app_id,feature,extra,value", where, nullptr, nullptr, &rows.count,
+                                &rows.rows) != 0) {
     return;
   }
-  for (int i = 0; i < rowCount; ++i) {
+  for (int i = 0; i < rows.count; ++i) {
     char* cursor = nullptr;
-    char* appId = RowSplitter::Next(rows[i], ",", &cursor);
+    char* appId = RowSplitter::Next(rows.rows[i], ",", &cursor);
     char* code = RowSplitter::Next(nullptr, ",", &cursor);
     char* extra = RowSplitter::Next(nullptr, ",", &cursor);
     char* value = RowSplitter::Next(nullptr, ",", &cursor);
@@ -348,52 +342,48 @@ void ReportScheduler::CopyStatusSnapshot(long lowerBound) {
     (void)snprintf(values, sizeof values, "'%s','%s','%s',%d", appId, code, extra,
                    static_cast<int>(strtol(value, nullptr, 10)));
     (void)feature->InsertRow("app_id,feature,extra,value", values);
-    delete[] rows[i];
   }
-  if (rowCount > 0) delete[] rows;
 
-  DbManager* survey = DbManager::GetInstance();
-  if (survey != nullptr && survey->GetConnection() != nullptr) {
-    (void)survey->GetConnection()->Exec("delete from report_app_status_survey;");
+  if (context.survey != nullptr && context.survey->GetConnection() != nullptr) {
+    (void)context.survey->GetConnection()->Exec("delete from report_app_status_survey;");
   }
 }
 
 void ReportScheduler::AddSdCardRow() {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
-  BaseLogProvider* feature =
-      registry != nullptr ? registry->Lookup("use_app_feature_survey") : nullptr;
+  ProviderRegistry* registry = context.providers;
+  BaseLogProvider* feature = registry != nullptr ? registry->Lookup(kFeatureTable) : nullptr;
   if (feature == nullptr) return;
   int mmc = 0;
   if (vconf_get_int(kMmcKey, &mmc) != 0) return;
-  LogManager* manager = LogManager::GetInstance();
   char values[512];
-  (void)snprintf(values, sizeof values, "'%s','%s',%d",
-                 manager != nullptr ? manager->GetName().c_str() : "", "SDCA", mmc >= 1 ? 1000 : 0);
+  (void)snprintf(values, sizeof values, "'%s','%s',%d", context.AppId(), kSdCardFeature,
+                 mmc >= 1 ? kSdCardPresent : 0);
   (void)feature->InsertRow("app_id,feature,value", values);
 }
 
 void ReportScheduler::AddRandomTimer() {
-  (void)ecore_timer_add(static_cast<double>(rand() % 7200 + 3600), OnRandomTimer, this);
+  (void)ecore_timer_add(static_cast<double>(rand() % kRandomDelaySpan + kRandomDelayMin),
+                        OnRandomTimer, this);
 }
 
 int ReportScheduler::StampSurveyUpdate() {
   struct sysinfo info;
   int err = sysinfo(&info);
   if (err != 0) return err;
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   return prefs != nullptr ? prefs->SetSurveyUpdateDate(static_cast<int32_t>(info.uptime)) : -1;
 }
 
 bool ReportScheduler::IsSurveyUpdateDue() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   struct sysinfo info;
   if (prefs == nullptr || sysinfo(&info) != 0) return false;
   long stamp = prefs->GetSurveyUpdateDate();
-  return stamp == 0 || info.uptime - stamp > 43199;
+  return stamp == 0 || info.uptime - stamp > kSurveyUpdateSeconds;
 }
 
 bool ReportScheduler::IsSentDateStale() {
-  PrefStore* prefs = Prefs();
+  PrefStore* prefs = context.prefs;
   return prefs != nullptr && static_cast<long long>(prefs->GetSentDate()) != MidnightDaysAgo(1);
 }
 

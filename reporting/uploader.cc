@@ -6,7 +6,8 @@
 
 #include <new>
 
-#include "include/log_manager.h"
+#include "base/clock.h"
+#include "include/db_connection.h"
 #include "providers/server_upload_log_provider.h"
 #include "reporting/row_splitter.h"
 
@@ -22,33 +23,28 @@ struct Rank {
   const char* activity;
   const char* then;
 };
-const Rank kRanks[] = {{"007", "' THEN 0 "},
-                       {"001", "' THEN 1 "},
-                       {"003", "' THEN 2 "},
-                       {"004", "' THEN 3 "},
-                       {"002", "' THEN 4 "}};
+const Rank kRanks[] = {{kActivitySummary, "' THEN 0 "},
+                       {kActivityUseApp, "' THEN 1 "},
+                       {kActivityManage, "' THEN 2 "},
+                       {kActivityError, "' THEN 3 "},
+                       {kActivityFeature, "' THEN 4 "}};
+// Records stamped before midnight this many days ago are dropped unsent.
+constexpr int kKeptDays = 3;
+constexpr char kSentMark[] = "success";
 
 enum Field { kId, kTimestamp, kSvcCode, kCategory, kActivity, kLogType, kAppVersion, kBody };
 
-void FreeRows(char** rows, int rowCount) {
-  if (rows == nullptr) return;
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
-}
-
 }  // namespace
 
-Uploader::~Uploader() { delete queue; }
+Uploader::Uploader(const ReportContext& context) : context(context) {}
+
+Uploader::~Uploader() = default;
 
 int Uploader::Init(ReportBuilder* reportBuilder) {
   if (reportBuilder == nullptr) return -1;
   builder = reportBuilder;
-  queue = new (std::nothrow) ServerUploadLogProvider();
+  queue.reset(new (std::nothrow) ServerUploadLogProvider());
   return queue == nullptr ? -1 : 0;
-}
-
-char** Uploader::SplitRows(char** rows, int rowCount) {
-  return RowSplitter::SplitRows(rows, rowCount, kRecordFields);
 }
 
 std::string Uploader::RankOrder() {
@@ -61,10 +57,8 @@ std::string Uploader::RankOrder() {
   return text + "END ";
 }
 
-int64_t Uploader::NowMs() const { return clockFn != nullptr ? clockFn() : SystemClockMs(); }
-
 void Uploader::SendAll() {
-  if (builder == nullptr || queue == nullptr || !GetRuntimeSwitch(1)) return;
+  if (builder == nullptr || queue == nullptr || !context.ReportEnabled()) return;
   PurgeOutOfWindow();
   // A record marked by a send that was cut short (a kill between mark and delete) was handed
   // over already: it goes now instead of being handed over again.
@@ -74,16 +68,10 @@ void Uploader::SendAll() {
 }
 
 void Uploader::PurgeOutOfWindow() {
-  int64_t now = NowMs();
-  time_t seconds = static_cast<time_t>(now / 1000);
-  struct tm tm;
-  if (localtime_r(&seconds, &tm) == nullptr) return;
-  tm.tm_hour = 0;
-  tm.tm_min = 0;
-  tm.tm_sec = 0;
-  tm.tm_mday -= 3;
-  tm.tm_isdst = -1;
-  long long lower = static_cast<long long>(mktime(&tm)) * 1000;
+  int64_t now = context.NowMs();
+  time_t oldest = LocalMidnightDaysBefore(static_cast<time_t>(now / 1000), kKeptDays);
+  if (oldest == 0) return;  // no local time
+  long long lower = static_cast<long long>(oldest) * 1000;
   char where[100];
   snprintf(where, sizeof(where), " timestamp < %lld or timestamp > %lld", lower,
            static_cast<long long>(now));
@@ -91,28 +79,20 @@ void Uploader::PurgeOutOfWindow() {
 }
 
 void Uploader::SendBatch(uint32_t limit) {
-  int rowCount = 0;
-  char** rows = nullptr;
+  QueryRows rows;
   std::string order = RankOrder();
-  if (queue->SelectLimitedRows(kQueueColumns, nullptr, order.c_str(), limit, &rowCount, &rows) !=
-          0 ||
-      rows == nullptr) {
-    FreeRows(rows, rowCount);
+  if (queue->SelectLimitedRows(kQueueColumns, nullptr, order.c_str(), limit, &rows.count,
+                               &rows.rows) != 0 ||
+      rows.rows == nullptr) {
     return;
   }
-  char** fields = SplitRows(rows, rowCount);
-  if (fields == nullptr) {
-    FreeRows(rows, rowCount);
-    return;
-  }
-  if (appId.empty()) {
-    LogManager* manager = LogManager::GetInstance();
-    if (manager != nullptr) appId = manager->GetName();
-  }
+  std::unique_ptr<char*[]> fields(RowSplitter::SplitRows(rows.rows, rows.count, kRecordFields));
+  if (fields == nullptr) return;
+  const char* appId = context.AppId();
 
-  for (int i = 0; i < rowCount; ++i) {
-    char** record = fields + static_cast<size_t>(i) * kRecordFields;
-    int64_t nowMs = NowMs();
+  for (int i = 0; i < rows.count; ++i) {
+    char** record = fields.get() + static_cast<size_t>(i) * kRecordFields;
+    int64_t nowMs = context.NowMs();
     time_t seconds = static_cast<time_t>(nowMs / 1000);
 
     corvane_log_item_h handle = nullptr;
@@ -120,7 +100,7 @@ void Uploader::SendBatch(uint32_t limit) {
     const struct {
       int item;
       const void* value;
-    } items[] = {{CORVANE_LOG_ITEM_APP_ID, appId.c_str()},
+    } items[] = {{CORVANE_LOG_ITEM_APP_ID, appId},
                  {CORVANE_LOG_ITEM_LOG_TYPE, record[kLogType]},
                  {CORVANE_LOG_ITEM_SVC_CODE, record[kSvcCode]},
                  {CORVANE_LOG_ITEM_TIME, &nowMs},
@@ -145,7 +125,7 @@ void Uploader::SendBatch(uint32_t limit) {
 
     char where[100];
     snprintf(where, sizeof(where), "_id = %s", record[kId]);
-    if (queue->UpdateRows("rly_result", "success", where) != 0) break;
+    if (queue->UpdateRows("rly_result", kSentMark, where) != 0) break;
 
     // Rendered as the hand-over log line would be; nothing is logged.
     char stamp[100];
@@ -154,13 +134,11 @@ void Uploader::SendBatch(uint32_t limit) {
       (void)strftime(stamp, sizeof(stamp), "%d/%b/%Y:%H:%M:%S", &tm);
     }
   }
-  delete[] fields;
-  FreeRows(rows, rowCount);
 }
 
 void Uploader::DeleteSent() {
   char where[100];
-  snprintf(where, sizeof(where), "rly_result = '%s'", "success");
+  snprintf(where, sizeof(where), "rly_result = '%s'", kSentMark);
   (void)queue->DeleteRows(where);
 }
 

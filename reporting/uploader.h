@@ -6,9 +6,11 @@
 
 #include <stdint.h>
 
+#include <memory>
 #include <string>
 
 #include "reporting/report_builder.h"
+#include "reporting/report_context.h"
 
 namespace _CorvaneLogManager {
 
@@ -21,7 +23,7 @@ class Uploader {
   // activity, log_type, app_version, body, rly_result.
   static constexpr int kRecordFields = 9;
 
-  Uploader() = default;
+  explicit Uploader(const ReportContext& context);
   ~Uploader();
   Uploader(const Uploader&) = delete;
   Uploader& operator=(const Uploader&) = delete;
@@ -33,25 +35,17 @@ class Uploader {
   // delete what was handed over. Runs only with a builder and runtime switch 1 on.
   void SendAll();
 
-  // The row splitter: nine field pointers per row, cut in place; null when allocation fails.
-  static char** SplitRows(char** rows, int rowCount);
   // "CASE activity WHEN '007' THEN 0 ... END " (ends in a blank: LIMIT follows directly).
   static std::string RankOrder();
 
-  // Defaults: the system clock and LogManager's application id.
-  void SetClock(ReportClock clock) { clockFn = clock; }
-  void SetAppId(const char* id) { appId = id != nullptr ? id : ""; }
-
  private:
-  int64_t NowMs() const;
   void PurgeOutOfWindow();
   void SendBatch(uint32_t limit);
   void DeleteSent();
 
-  ServerUploadLogProvider* queue = nullptr;
+  std::unique_ptr<ServerUploadLogProvider> queue;
   ReportBuilder* builder = nullptr;
-  ReportClock clockFn = nullptr;
-  std::string appId;
+  const ReportContext context;
 };
 
 }  // namespace _CorvaneLogManager

@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <atomic>
+#include <memory>
 
 #include "tests/reporting/reporting_test_env.h"
 
@@ -17,8 +18,7 @@ class ReportBuilderTest : public ReportingTest {
  protected:
   void SetUp() override {
     ReportingTest::SetUp();
-    builder.SetPrefStore(&prefs);
-    builder.SetClock(&TestClock);
+    builder = std::make_unique<ReportBuilder>(Context());
   }
 
   void Now(int year, int month, int day, int hour) {
@@ -37,7 +37,7 @@ class ReportBuilderTest : public ReportingTest {
                   "SELECT body FROM survey_log WHERE activity='" + activity + "' ORDER BY _id");
   }
 
-  ReportBuilder builder;
+  std::unique_ptr<ReportBuilder> builder;
 };
 
 TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
@@ -59,7 +59,7 @@ TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
       "'lm','SCRN','',1000");
   Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 15), "'lm','WIFI','',10");
 
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
 
   const std::vector<std::string> use = {
       kHead + "date=2024-06-11T03:00:00+0200¶sum=3¶count=2¶app_id=a.calc¶duration=1500",
@@ -106,7 +106,7 @@ TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
   EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
 
   // Nothing is due any more: a second run writes nothing.
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_EQ(Column(upload, "SELECT count(*) FROM survey_log"), std::vector<std::string>{"9"});
 }
 
@@ -116,7 +116,7 @@ TEST_F(ReportBuilderTest, ThreeDaysBackAreProcessedOldestFirst) {
   Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 10, 12), "'m.two',0");
   Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 9, 12), "'m.one',0");
 
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
 
   std::vector<std::string> summaryDates;
   for (const std::string& body : Bodies("007"))
@@ -137,7 +137,7 @@ TEST_F(ReportBuilderTest, ManageRowInTheLastSecondIsDroppedUnreportedByTheNextDa
       "'m.late',0");
   Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 9, 23, 59, 59, 500), "'u.late',7");
 
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_TRUE(Bodies("003").empty());
   EXPECT_EQ(Column(survey, "SELECT installed_app_id FROM manage_app_survey"),
             std::vector<std::string>{"m.late"});
@@ -146,7 +146,7 @@ TEST_F(ReportBuilderTest, ManageRowInTheLastSecondIsDroppedUnreportedByTheNextDa
   EXPECT_NE(Bodies("001")[0].find("¶app_id=u.late¶duration=7"), std::string::npos);
 
   Now(2024, 6, 11, 10);
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_TRUE(Bodies("003").empty());
   EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"),
             std::vector<std::string>{"0"});
@@ -162,7 +162,7 @@ TEST_F(ReportBuilderTest, QuotesAndCommasFromOutsideCallersStayInTheirOwnRecord)
   Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 5),
       "'lm','CAPT','a''b',1");
 
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
 
   const std::string head = "mcc=¶mnc=¶did=¶model=Gear; Rev 'B'¶fw_ver=W2.3-K9¶";
   const std::string date = "date=2024-06-11T03:00:00+0200¶";
@@ -195,7 +195,7 @@ TEST_F(ReportBuilderTest, SumsPastTheIntegerLimitSaturateAndCostNoOtherRecord) {
   Row(feature, "app_id,feature,extra,value", t, "'x','NEG','',-7");
   Row(feature, "app_id,feature,extra,value", t, "'lm','SCRN','',4000");
 
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
 
   const std::string date = "date=2024-06-11T03:00:00+0200¶sum=3¶";
   EXPECT_EQ(Bodies("001"), (std::vector<std::string>{
@@ -228,7 +228,7 @@ TEST_F(ReportBuilderTest, ATableWhoseSelectFailsKeepsItsRowsAndTheDayStaysDue) {
   };
   alter("ALTER TABLE use_app_feature_survey RENAME COLUMN extra TO gone");
 
-  EXPECT_EQ(builder.RunDaily(), -1);
+  EXPECT_EQ(builder->RunDaily(), -1);
   EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_feature_survey"),
             std::vector<std::string>{"1"});
   EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_survey"), std::vector<std::string>{"0"});
@@ -236,7 +236,7 @@ TEST_F(ReportBuilderTest, ATableWhoseSelectFailsKeepsItsRowsAndTheDayStaysDue) {
 
   // The repeat completes the day; the purged table's record is not queued again.
   alter("ALTER TABLE use_app_feature_survey RENAME COLUMN gone TO extra");
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_EQ(Bodies("001").size(), 1u);
   EXPECT_EQ(Bodies("002").size(), 1u);
   EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_feature_survey"),
@@ -276,7 +276,7 @@ TEST_F(ReportBuilderTest, AWorkerStoppedInsideATablesRecordsLeavesThemToTheNextR
       self->returned = true;
       return nullptr;
     }
-  } stopped{&builder};
+  } stopped{builder.get()};
   sqlite3_update_hook(upload->Handle(), &Stopped::OnChange, &stopped);
   pthread_t worker;
   ASSERT_EQ(pthread_create(&worker, nullptr, &Stopped::Run, &stopped), 0);
@@ -305,7 +305,7 @@ TEST_F(ReportBuilderTest, AWorkerStoppedInsideATablesRecordsLeavesThemToTheNextR
             std::vector<std::string>{"5"});
   EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 10) / 1000);
 
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_FALSE(upload->InTransaction());
   EXPECT_EQ(Bodies("001").size(), 2u);
   std::vector<std::string> manage = Bodies("003");
@@ -331,7 +331,7 @@ TEST_F(ReportBuilderTest, LongBodiesAreStoredWholeOrCutAtACharacterAndTalliedInF
   Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 4),
       "'" + longExtra + "','" + longFeature + "','" + marks + "',2");
 
-  ASSERT_EQ(builder.RunDaily(), 0);
+  ASSERT_EQ(builder->RunDaily(), 0);
 
   const std::string whole =
       kHead + "date=2024-06-11T03:00:00+0200¶sum=3¶count=1¶app_id=lm¶feature=" + longFeature +
@@ -366,10 +366,10 @@ TEST_F(ReportBuilderTest, WindowsTileTheDayAcrossSummerTime) {
   for (const Case& c : cases) {
     SCOPED_TRACE(std::to_string(c.month) + "/" + std::to_string(c.day) + " offset " +
                  std::to_string(c.offset));
-    builder.ComputeWindow(static_cast<time_t>(LocalMs(2024, c.month, c.day) / 1000), c.mode,
-                          c.offset, c.length);
-    EXPECT_EQ(builder.WindowStart(), std::to_string(c.start));
-    EXPECT_EQ(builder.WindowEnd(), std::to_string(c.end));
+    builder->ComputeWindow(static_cast<time_t>(LocalMs(2024, c.month, c.day) / 1000), c.mode,
+                           c.offset, c.length);
+    EXPECT_EQ(builder->WindowStart(), std::to_string(c.start));
+    EXPECT_EQ(builder->WindowEnd(), std::to_string(c.end));
   }
 }
 

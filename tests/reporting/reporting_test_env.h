@@ -15,8 +15,8 @@
 #include <vector>
 
 #include "include/db_connection.h"
-#include "include/log_manager.h"
 #include "include/provider_registry.h"
+#include "reporting/report_context.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
 
@@ -24,6 +24,7 @@ namespace _CorvaneLogManager {
 
 inline int64_t g_testNowMs = 0;
 inline int64_t TestClock() { return g_testNowMs; }
+inline bool TestReportEnabled() { return true; }
 
 class ReportingTest : public ::testing::Test {
  protected:
@@ -49,7 +50,6 @@ class ReportingTest : public ::testing::Test {
     survey = DbManager::GetInstance()->GetConnection();
     upload = UploadDbManager::GetInstance()->GetConnection();
     ASSERT_EQ(prefs.Create(), 0);
-    SetRuntimeSwitch(1, true);
   }
 
   void TearDown() override {
@@ -59,6 +59,19 @@ class ReportingTest : public ::testing::Test {
     UploadDbManager::CloseInstance();
     unsetenv("LOGMGR_SYSROOT");
     (void)system(("rm -rf " + sysroot).c_str());
+  }
+
+  // What the daemon hands the report run, with the test clock.
+  ReportContext Context() {
+    ReportContext context;
+    context.prefs = &prefs;
+    context.providers = ProviderRegistry::GetInstance();
+    context.survey = DbManager::GetInstance();
+    context.queue = UploadDbManager::GetInstance();
+    context.clock = TestClock;
+    context.appId = &appId;
+    context.reportEnabled = TestReportEnabled;
+    return context;
   }
 
   void WriteFile(const std::string& fixedPath, const std::string& text) {
@@ -114,6 +127,7 @@ class ReportingTest : public ::testing::Test {
   DbConnection* survey = nullptr;
   DbConnection* upload = nullptr;
   PrefStore prefs;
+  const std::string appId = "com.corvane.logmanager";
 };
 
 }  // namespace _CorvaneLogManager

@@ -3,6 +3,8 @@
 #include <string.h>
 #include <unistd.h>
 
+#include <memory>
+
 #include "reporting/row_splitter.h"
 #include "tests/reporting/reporting_test_env.h"
 
@@ -35,9 +37,9 @@ class UploaderTest : public ReportingTest {
   void SetUp() override {
     ReportingTest::SetUp();
     g_testNowMs = LocalMs(2024, 6, 12, 10);
-    uploader.SetClock(&TestClock);
-    uploader.SetAppId("com.corvane.logmanager");
-    ASSERT_EQ(uploader.Init(&builder), 0);
+    builder = std::make_unique<ReportBuilder>(Context());
+    uploader = std::make_unique<Uploader>(Context());
+    ASSERT_EQ(uploader->Init(builder.get()), 0);
   }
 
   void Queue(const std::string& activity, int64_t stamp, const std::string& body = "b") {
@@ -56,8 +58,8 @@ class UploaderTest : public ReportingTest {
     return out;
   }
 
-  ReportBuilder builder;
-  Uploader uploader;
+  std::unique_ptr<ReportBuilder> builder;
+  std::unique_ptr<Uploader> uploader;
 };
 
 TEST_F(UploaderTest, HandsOverAtMostOneBatchInRankOrderWithAllItems) {
@@ -68,7 +70,7 @@ TEST_F(UploaderTest, HandsOverAtMostOneBatchInRankOrderWithAllItems) {
   }
   Exec(upload, "COMMIT;");
 
-  uploader.SendAll();
+  uploader->SendAll();
 
   std::vector<std::string> expected(300, "007");
   expected.insert(expected.end(), 300, "001");
@@ -93,7 +95,7 @@ TEST_F(UploaderTest, OutOfWindowRecordsArePurgedUnsent) {
   Queue("001", g_testNowMs, "now");
   Queue("002", g_testNowMs, "quote \" and ¶");
 
-  uploader.SendAll();
+  uploader->SendAll();
 
   std::vector<std::string> bodies;
   for (const std::string& line : OutboxLines()) {
@@ -104,7 +106,7 @@ TEST_F(UploaderTest, OutOfWindowRecordsArePurgedUnsent) {
   EXPECT_EQ(Column(upload, "SELECT count(*) FROM survey_log"), std::vector<std::string>{"0"});
 
   // An empty queue makes no relay call at all.
-  uploader.SendAll();
+  uploader->SendAll();
   EXPECT_EQ(OutboxLines().size(), 3u);
 }
 
@@ -113,7 +115,7 @@ TEST_F(UploaderTest, ARecordMarkedByASendCutShortGoesWithoutBeingHandedOverAgain
   Queue("001", g_testNowMs, "not reached");
   Exec(upload, "UPDATE survey_log SET rly_result='success' WHERE body='taken before the kill';");
 
-  uploader.SendAll();
+  uploader->SendAll();
 
   ASSERT_EQ(OutboxLines().size(), 1u);
   EXPECT_NE(OutboxLines()[0].find("not reached"), std::string::npos);
@@ -131,7 +133,7 @@ TEST_F(UploaderTest, RelayFailureOnTheThirdRecordKeepsTheRestQueued) {
           int64_t stamp = g_testNowMs - 1000;
           for (const char* activity : {"002", "004", "003", "001", "007"}) Queue(activity, stamp);
           setenv("LOGRELAY_FAIL", fault, 1);
-          uploader.SendAll();
+          uploader->SendAll();
           std::string problems;
           if (SentActivities() != std::vector<std::string>{"007", "001"}) problems += "sent; ";
           if (Column(upload,
@@ -139,7 +141,7 @@ TEST_F(UploaderTest, RelayFailureOnTheThirdRecordKeepsTheRestQueued) {
                      "rly_result IS NULL") != std::vector<std::string>{"002,004,003"})
             problems += "queue; ";
           unsetenv("LOGRELAY_FAIL");
-          uploader.SendAll();  // the next send takes the rest, once
+          uploader->SendAll();  // the next send takes the rest, once
           if (SentActivities() != std::vector<std::string>{"007", "001", "003", "004", "002"})
             problems += "resend; ";
           fprintf(stderr, "%s", problems.c_str());
