@@ -65,8 +65,8 @@ int LogManager::Construct() {
     return -1;
   }
   ReportContext report;
-  report.prefs = prefStore;
-  report.providers = ProviderRegistry::GetInstance();
+  report.prefs = prefStore.get();
+  report.providers = providers;
   report.survey = DbManager::GetInstance();
   report.queue = UploadDbManager::GetInstance();
   report.appId = &name;
