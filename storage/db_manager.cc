@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <new>
 
-#include "include/base_log_provider.h"
 #include "include/db_connection.h"
 #include "platform/fixed_path.h"
+#include "storage/db_response_listener.h"
 
 namespace _CorvaneLogManager {
 
@@ -25,12 +25,8 @@ int OpenFixed(DbConnection* connection, const char* path) {
   return connection->Open(logmgr_fixed_path(path, buf, sizeof(buf)));
 }
 
-// Listeners are providers; anything else has no table to create or trim.
 void InitializeAll(const std::vector<IDbResponseListener*>& listeners) {
-  for (IDbResponseListener* listener : listeners) {
-    BaseLogProvider* provider = dynamic_cast<BaseLogProvider*>(listener);
-    if (provider != nullptr) (void)provider->Initialize();
-  }
+  for (IDbResponseListener* listener : listeners) (void)listener->Initialize();
 }
 
 }  // namespace
@@ -79,10 +75,7 @@ int DbManager::Init() {
 }
 
 int DbManager::NotifyDeleteExpired() {
-  for (IDbResponseListener* listener : listeners) {
-    BaseLogProvider* provider = dynamic_cast<BaseLogProvider*>(listener);
-    if (provider != nullptr) (void)provider->DeleteExpiredRows();
-  }
+  for (IDbResponseListener* listener : listeners) (void)listener->DeleteExpiredRows();
   return 0;
 }
 
