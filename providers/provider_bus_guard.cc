@@ -10,6 +10,7 @@
 #include <sys/time.h>
 #include <unistd.h>
 
+#include "include/db_connection.h"
 #include "providers/local_zone.h"
 #include "providers/statement_buffer.h"
 
@@ -152,9 +153,9 @@ bool DeleteFits(const std::string& table, const char* where) {
   return strlen("DELETE FROM  WHERE ;") + table.size() + strlen(where) < kStatementSize;
 }
 
-size_t SegmentBytes(char** rows, int rowCount) {
+size_t SegmentBytes(const QueryRows& rows) {
   size_t bytes = 1;
-  for (int i = 0; i < rowCount; ++i) bytes += strlen(rows[i]) + 1;
+  for (int i = 0; i < rows.count; ++i) bytes += strlen(rows[i]) + 1;
   return bytes;
 }
 
@@ -165,12 +166,12 @@ size_t SegmentRoom(int shmId, uid_t callerUid) {
   return info.shm_segsz;
 }
 
-int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
+int WriteRowsToSegment(int shmId, uid_t callerUid, const QueryRows& rows) {
   // Attached first and checked after: an attached segment keeps its id, so what is checked is
   // what is written, even if the caller removes it and makes another meanwhile.
   void* base = shmat(shmId, nullptr, 0);
   if (base == reinterpret_cast<void*>(-1)) return -1;
-  size_t bytes = SegmentBytes(rows, rowCount);
+  size_t bytes = SegmentBytes(rows);
   bool ok = bytes <= SegmentRoom(shmId, callerUid);
   // One pipe for the whole result; chunks of a default pipe's capacity (a smaller pipe takes
   // them in parts).
@@ -193,7 +194,7 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
       }
     }
   };
-  for (int i = 0; ok && i < rowCount; ++i) stage(rows[i], strlen(rows[i]) + 1);
+  for (int i = 0; ok && i < rows.count; ++i) stage(rows[i], strlen(rows[i]) + 1);
   stage("&", 1);
   if (ok && staged > 0)
     ok = CopyThroughKernel(fds, static_cast<char*>(base) + written, chunk, staged);
@@ -203,12 +204,6 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
   }
   (void)shmdt(base);
   return ok ? 0 : -1;
-}
-
-void FreeRows(char** rows, int rowCount) {
-  if (rows == nullptr) return;
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
 }
 
 }  // namespace _CorvaneLogManager

@@ -12,6 +12,8 @@
 
 namespace _CorvaneLogManager {
 
+struct QueryRows;
+
 // Column and value lists built from a caller's row_data, plus the texts the provider will
 // append for timestamp and time_zone (measured so the statement sizes can be checked first).
 struct BusRowLists {
@@ -43,7 +45,7 @@ bool SelectFits(const std::string& table, const char* columns, const char* where
 bool DeleteFits(const std::string& table, const char* where);
 
 // Bytes a select result takes in the segment: each row text and its NUL, then the "&" mark.
-size_t SegmentBytes(char** rows, int rowCount);
+size_t SegmentBytes(const QueryRows& rows);
 
 // Bytes segment |shmId| may take: its size when it exists, belongs to |callerUid| and lets its
 // owner write; 0 otherwise.
@@ -52,11 +54,9 @@ size_t SegmentRoom(int shmId, uid_t callerUid);
 // Writes the rows into System V segment |shmId| and detaches it. 0 on success; -1 without
 // writing anything when the segment is unknown, not owned by |callerUid|, not writable by its
 // owner, too small for the whole result, or cannot be attached; -1 too when a page of it
-// cannot be had (the copy stops there, and the daemon carries on).
-int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount);
-
-// Frees a select result (each row text, then the array).
-void FreeRows(char** rows, int rowCount);
+// cannot be had (the copy stops there, and the daemon carries on). The segment gets a copy:
+// the rows stay the caller's.
+int WriteRowsToSegment(int shmId, uid_t callerUid, const QueryRows& rows);
 
 }  // namespace _CorvaneLogManager
 

@@ -256,15 +256,12 @@ gboolean UpsertInsert(const BusTable* table, BaseLogProvider* provider, GHashTab
 
   DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
   if (!scope.Held()) return Fail(table, error, kApiFailed);
-  int rowCount = 0;
-  char** rows = nullptr;
-  int selected = provider->SelectRows("_id", condition.c_str(), nullptr, &rowCount, &rows);
-  long existingId = 0;
-  // The row text ends in a comma, which stops the conversion.
-  if (selected == 0 && rowCount == 1) existingId = strtol(rows[0], nullptr, 10);
-  if (selected == 0) FreeRows(rows, rowCount);
-  if (selected == -1) return Fail(table, error, kApiFailed);
-  if (rowCount == 1) {
+  QueryRows rows;
+  if (provider->SelectRows("_id", condition.c_str(), nullptr, &rows.count, &rows.rows) == -1)
+    return Fail(table, error, kApiFailed);
+  if (rows.count == 1) {
+    // The row text ends in a comma, which stops the conversion.
+    long existingId = strtol(rows[0], nullptr, 10);
     *lastRowId = static_cast<gint>(existingId);
     if (lists.valueHasComma || !UpdateFits(tableName, lists, autoTexts, condition.c_str()))
       return Fail(table, error, kApiFailed);
@@ -272,7 +269,7 @@ gboolean UpsertInsert(const BusTable* table, BaseLogProvider* provider, GHashTab
       return Fail(table, error, kApiFailed);
     return TRUE;
   }
-  if (rowCount > 1) return TRUE;  // ambiguous pair: nothing is written, deliberately
+  if (rows.count > 1) return TRUE;  // ambiguous pair: nothing is written, deliberately
   int32_t rowId = -1;
   if (provider->InsertRow(lists.columns.c_str(), lists.values.c_str(), &rowId) == -1)
     return Fail(table, error, kInsertFailed);
@@ -328,19 +325,18 @@ gboolean logmgr_provider_bus_select(GObject* self, const char* columns, const ch
   if (columns == nullptr || !SelectFits(provider->Config().tableName, columns, nullptr)) return -1;
   uid_t caller = 0;
   bool known = CallerUid(&caller);
-  int rowCount = 0;
-  char** rows = nullptr;
+  QueryRows rows;
   {
     DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
     if (!scope.Held()) return -1;
     // Rendering stops where the result stops fitting the segment; a segment that is not the
     // caller's takes nothing.
     scope.LimitResult(known ? SegmentRoom(static_cast<int>(shmId), caller) : 0);
-    if (provider->SelectRows(columns, nullptr, nullptr, &rowCount, &rows) != 0)
+    if (provider->SelectRows(columns, nullptr, nullptr, &rows.count, &rows.rows) != 0)
       return scope.ResultTooLarge() ? FALSE : -1;
   }
-  bool written = known && WriteRowsToSegment(static_cast<int>(shmId), caller, rows, rowCount) == 0;
-  FreeRows(rows, rowCount);
+  // The segment gets a copy; the rows stay this handler's and go with it.
+  bool written = known && WriteRowsToSegment(static_cast<int>(shmId), caller, rows) == 0;
   return written ? TRUE : FALSE;
 }
 

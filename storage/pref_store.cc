@@ -158,15 +158,10 @@ int PrefStore::GetString(const char* key, std::string* value) {
   char sql[1024];
   (void)snprintf(sql, sizeof(sql), "SELECT %s FROM %s WHERE %s=%s;", "pref_data", kTable,
                  "pref_key", keyLiteral);
-  int count = 0;
-  char** rows = nullptr;
-  int rc = connection->Select(sql, kTable, &count, &rows);
+  QueryRows rows;
+  int rc = connection->Select(sql, kTable, &rows.count, &rows.rows);
   value->clear();
-  if (rc == 0 && count == 1) *value = rows[0];  // trailing comma kept on purpose
-  if (rc == 0 && count > 0) {
-    for (int i = 0; i < count; ++i) delete[] rows[i];
-    delete[] rows;
-  }
+  if (rc == 0 && rows.count == 1) *value = rows[0];  // trailing comma kept on purpose
   return rc;
 }
 

@@ -76,10 +76,9 @@ int StatusSnapshotStore::Get(const char* feature, std::string* extraOut, int64_t
   (void)snprintf(sql, sizeof(sql),
                  "SELECT extra,timestamp FROM survey_status_monitor WHERE feature = %s;",
                  featureLiteral);
-  int rowCount = 0;
-  char** rows = nullptr;
-  if (connection->Select(sql, kTable, &rowCount, &rows) != 0) return -1;
-  if (rowCount <= 0) {
+  QueryRows rows;
+  if (connection->Select(sql, kTable, &rows.count, &rows.rows) != 0) return -1;
+  if (rows.count <= 0) {
     *extraOut = "";
     *timestampOut = 0;
     return 0;
@@ -94,8 +93,6 @@ int StatusSnapshotStore::Get(const char* feature, std::string* extraOut, int64_t
     extraOut->assign(row, comma - row);
     *timestampOut = strtoll(comma + 1, nullptr, 10);
   }
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
   return 0;
 }
 

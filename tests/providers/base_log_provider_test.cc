@@ -99,20 +99,16 @@ TEST_F(BaseLogProviderTest, UpdateQuotesBareValuesAndRefreshesAutoColumns) {
 TEST_F(BaseLogProviderTest, SelectPlacesGroupByBeforeOrderBy) {
   Fill(survey, "use_app_survey", "app_id,duration", "'a',1", 2);
   Fill(survey, "use_app_survey", "app_id,duration", "'b',4", 1);
-  int rowCount = -1;
-  char** rows = nullptr;
+  QueryRows rows;
   ASSERT_EQ(useApp->SelectGroupedRows("app_id,SUM(duration)", "duration > 0", "app_id DESC",
-                                      "app_id", &rowCount, &rows),
+                                      "app_id", &rows.count, &rows.rows),
             0);
-  ASSERT_EQ(rowCount, 2);
+  ASSERT_EQ(rows.count, 2);
   EXPECT_STREQ(rows[0], "b,4,");
   EXPECT_STREQ(rows[1], "a,2,");
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
-  ASSERT_EQ(useApp->SelectRows(nullptr, nullptr, nullptr, &rowCount, &rows), 0);
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
-  EXPECT_EQ(rowCount, 3);
+  rows.Reset();
+  ASSERT_EQ(useApp->SelectRows(nullptr, nullptr, nullptr, &rows.count, &rows.rows), 0);
+  EXPECT_EQ(rows.count, 3);
   EXPECT_EQ(Taken("SELECT"),
             (std::vector<std::string>{"SELECT app_id,SUM(duration) FROM use_app_survey WHERE "
                                       "duration > 0 GROUP BY app_id ORDER BY app_id DESC;",

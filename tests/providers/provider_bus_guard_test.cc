@@ -156,10 +156,8 @@ TEST_F(ProviderBusFitTest, LargestAcceptedStatementsRunWholeAndOneMoreIsRefused)
 
   std::string columns = "app_id";
   while (SelectFits(table, (columns + " ").c_str(), nullptr)) columns += " ";
-  int rowCount = 0;
-  char** rows = nullptr;
-  ASSERT_EQ(Feature()->SelectRows(columns.c_str(), nullptr, nullptr, &rowCount, &rows), 0);
-  FreeRows(rows, rowCount);
+  QueryRows rows;
+  ASSERT_EQ(Feature()->SelectRows(columns.c_str(), nullptr, nullptr, &rows.count, &rows.rows), 0);
   EXPECT_EQ(LastStatement("SELECT").size(), 1023u);
 
   where = "0";
@@ -218,12 +216,23 @@ TEST(ProviderBusGuardTest, ABusRequestScopeConfinesStatementsToTheOwnTableWhileA
   (void)system(("rm -rf " + dir).c_str());
 }
 
+// The first |count| rows of "x,1," and "y,2,", owned as a select hands them out.
+void TwoRowResult(int count, QueryRows* rows) {
+  rows->Reset();
+  if (count == 0) return;
+  rows->rows = new char*[count];
+  for (int i = 0; i < count; ++i) {
+    rows->rows[i] = new char[5];
+    memcpy(rows->rows[i], i == 0 ? "x,1," : "y,2,", 5);
+  }
+  rows->count = count;
+}
+
 TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetached) {
-  char first[] = "x,1,";
-  char second[] = "y,2,";
-  char* rows[] = {first, second};
+  QueryRows rows;
+  TwoRowResult(2, &rows);
   const char kResult[] = "x,1,\0y,2,\0&";
-  ASSERT_EQ(SegmentBytes(rows, 2), sizeof(kResult) - 1);
+  ASSERT_EQ(SegmentBytes(rows), sizeof(kResult) - 1);
   struct Case {
     size_t size;
     uid_t owner;
@@ -238,7 +247,9 @@ TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetach
     SCOPED_TRACE("size " + std::to_string(c.size) + " rows " + std::to_string(c.rowCount));
     int id = shmget(IPC_PRIVATE, c.size, IPC_CREAT | 0600);
     ASSERT_NE(id, -1);
-    EXPECT_EQ(WriteRowsToSegment(id, c.owner, rows, c.rowCount), c.result);
+    QueryRows result;
+    TwoRowResult(c.rowCount, &result);
+    EXPECT_EQ(WriteRowsToSegment(id, c.owner, result), c.result);
     struct shmid_ds info;
     ASSERT_EQ(shmctl(id, IPC_STAT, &info), 0);
     EXPECT_EQ(info.shm_nattch, 0u);
@@ -251,13 +262,13 @@ TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetach
     shmdt(base);
     shmctl(id, IPC_RMID, nullptr);
   }
-  EXPECT_EQ(WriteRowsToSegment(-1, getuid(), rows, 2), -1);
+  EXPECT_EQ(WriteRowsToSegment(-1, getuid(), rows), -1);
 
   // A segment whose owner may not write it is refused, whoever could still attach it.
   int readOnly = shmget(IPC_PRIVATE, 64, IPC_CREAT | 0400);
   ASSERT_NE(readOnly, -1);
   EXPECT_EQ(SegmentRoom(readOnly, getuid()), 0u);
-  EXPECT_EQ(WriteRowsToSegment(readOnly, getuid(), rows, 2), -1);
+  EXPECT_EQ(WriteRowsToSegment(readOnly, getuid(), rows), -1);
   shmctl(readOnly, IPC_RMID, nullptr);
 
   // A hugetlb segment without reserve has no page to give where the pool is empty: writing it
@@ -266,7 +277,7 @@ TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetach
   int huge = shmget(IPC_PRIVATE, 2 << 20, IPC_CREAT | 0600 | SHM_HUGETLB | SHM_NORESERVE);
   if (huge == -1) GTEST_SKIP() << "no hugetlb segments here";
   EXPECT_EQ(SegmentRoom(huge, getuid()), size_t{2} << 20);
-  int result = WriteRowsToSegment(huge, getuid(), rows, 2);
+  int result = WriteRowsToSegment(huge, getuid(), rows);
   FILE* pool = fopen("/proc/sys/vm/nr_hugepages", "r");
   long pages = -1;
   if (pool != nullptr) {
