@@ -58,6 +58,14 @@ class BaseLogProvider : public IDbResponseListener {
   virtual int GetRowCount();
   virtual int DeleteOldestRows();
 
+  // Whether each statement these arguments make (with timestamp and time_zone as they would be
+  // now) comes out of its fixed buffer whole. A cut statement would run as cut and a list past
+  // its buffer ends the process, so requests from other processes are asked about first.
+  bool InsertFits(const char* columns, const char* values);
+  bool UpdateFits(const char* columns, const char* values, const char* where);
+  bool SelectFits(const char* columns, const char* where);
+  bool DeleteFits(const char* where);
+
   const TableConfig& Config() const { return config; }
 
  protected:

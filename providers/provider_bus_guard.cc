@@ -7,12 +7,9 @@
 #include <sys/ipc.h>
 #include <sys/shm.h>
 #include <sys/stat.h>
-#include <sys/time.h>
 #include <unistd.h>
 
 #include "include/db_connection.h"
-#include "providers/local_zone.h"
-#include "providers/statement_buffer.h"
 
 namespace _CorvaneLogManager {
 
@@ -20,26 +17,6 @@ namespace {
 
 bool IsAutoColumn(const char* name) {
   return strcmp(name, "timestamp") == 0 || strcmp(name, "time_zone") == 0;
-}
-
-// Length of the SET text the provider makes of these lists: both cut at commas (empty pieces
-// skipped) and paired in step, each pair "c = v," or "c = 'v',".
-size_t SetLength(const std::string& columns, const std::string& values) {
-  std::vector<std::string> cols;
-  std::vector<std::string> vals;
-  for (auto [text, out] : {std::make_pair(&columns, &cols), std::make_pair(&values, &vals)}) {
-    size_t start = 0;
-    while (start <= text->size()) {
-      size_t end = text->find(',', start);
-      if (end == std::string::npos) end = text->size();
-      if (end > start) out->push_back(text->substr(start, end - start));
-      start = end + 1;
-    }
-  }
-  size_t length = 0;
-  for (size_t i = 0; i < cols.size() && i < vals.size(); ++i)
-    length += cols[i].size() + 4 + vals[i].size() + (vals[i][0] == '\'' ? 0 : 2);
-  return length;
 }
 
 bool IsCallerRowId(const char* value) {
@@ -99,58 +76,6 @@ int AppendRowEntry(const std::vector<std::string>& declared, const char* key, co
   lists->values.append("'").append(value).append("'");
   if (strchr(value, ',') != nullptr) lists->valueHasComma = true;
   return 0;
-}
-
-BusRowLists AutoColumnTexts(const std::vector<std::string>& declared) {
-  BusRowLists texts;
-  for (const std::string& column : declared) {
-    if (column == "timestamp") {
-      struct timeval tv;
-      gettimeofday(&tv, nullptr);
-      char now[32];
-      snprintf(now, sizeof(now), ",%lld",
-               static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000);
-      texts.columns.append(",timestamp");
-      texts.values.append(now);
-    } else if (column == "time_zone") {
-      std::string zone;
-      if (!LocalZoneLiteral(&zone)) continue;
-      texts.columns.append(",time_zone");
-      texts.values.append(",").append(zone);
-    }
-  }
-  return texts;
-}
-
-bool InsertFits(const std::string& table, const BusRowLists& lists, const BusRowLists& autoTexts) {
-  if (lists.columns.size() >= kListSize) return false;
-  size_t statement = strlen("INSERT INTO () VALUES ();") + table.size() + lists.columns.size() +
-                     autoTexts.columns.size() + lists.values.size() + autoTexts.values.size();
-  return statement < kStatementSize;
-}
-
-bool UpdateFits(const std::string& table, const BusRowLists& lists, const BusRowLists& autoTexts,
-                const char* where) {
-  if (where == nullptr) return true;  // the provider refuses it before building anything
-  std::string columns = lists.columns + autoTexts.columns;
-  std::string values = lists.values + autoTexts.values;
-  if (columns.size() >= kListSize || values.size() >= kListSize) return false;
-  // The SET text is built with a trailing comma, which is dropped before the statement.
-  size_t set = SetLength(columns, values);
-  if (set >= kStatementSize) return false;
-  if (set > 0) --set;
-  size_t statement = strlen("UPDATE  SET  WHERE ;") + table.size() + set + strlen(where);
-  return statement < kStatementSize;
-}
-
-bool SelectFits(const std::string& table, const char* columns, const char* where) {
-  size_t statement = strlen("SELECT  FROM ;") + table.size() + strlen(columns);
-  if (where != nullptr) statement += strlen(" WHERE ") + strlen(where);
-  return statement < kStatementSize;
-}
-
-bool DeleteFits(const std::string& table, const char* where) {
-  return strlen("DELETE FROM  WHERE ;") + table.size() + strlen(where) < kStatementSize;
 }
 
 size_t SegmentBytes(const QueryRows& rows) {

@@ -231,7 +231,7 @@ bool HasKey(GHashTable* rowData, const char* key) {
 
 gboolean PlainInsert(const BusTable* table, BaseLogProvider* provider, const BusRowLists& lists,
                      gint* lastRowId, GError** error) {
-  if (!InsertFits(provider->Config().tableName, lists, AutoColumnTexts(provider->Config().columns)))
+  if (!provider->InsertFits(lists.columns.c_str(), lists.values.c_str()))
     return Fail(table, error, kImproperValues);
   DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
   int32_t rowId = -1;
@@ -248,10 +248,9 @@ gboolean UpsertInsert(const BusTable* table, BaseLogProvider* provider, GHashTab
   std::string condition =
       std::string("app_id='") + static_cast<const char*>(g_hash_table_lookup(rowData, "app_id")) +
       "' and feature='" + static_cast<const char*>(g_hash_table_lookup(rowData, "feature")) + "'";
-  const std::string& tableName = provider->Config().tableName;
-  BusRowLists autoTexts = AutoColumnTexts(provider->Config().columns);
   // The update's 200-byte lists and its comma split only matter when the pair exists.
-  if (!SelectFits(tableName, "_id", condition.c_str()) || !InsertFits(tableName, lists, autoTexts))
+  if (!provider->SelectFits("_id", condition.c_str()) ||
+      !provider->InsertFits(lists.columns.c_str(), lists.values.c_str()))
     return Fail(table, error, kImproperValues);
 
   DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
@@ -263,7 +262,8 @@ gboolean UpsertInsert(const BusTable* table, BaseLogProvider* provider, GHashTab
     // The row text ends in a comma, which stops the conversion.
     long existingId = strtol(rows[0], nullptr, 10);
     *lastRowId = static_cast<gint>(existingId);
-    if (lists.valueHasComma || !UpdateFits(tableName, lists, autoTexts, condition.c_str()))
+    if (lists.valueHasComma ||
+        !provider->UpdateFits(lists.columns.c_str(), lists.values.c_str(), condition.c_str()))
       return Fail(table, error, kApiFailed);
     if (provider->UpdateRows(lists.columns.c_str(), lists.values.c_str(), condition.c_str()) == -1)
       return Fail(table, error, kApiFailed);
@@ -302,8 +302,8 @@ gboolean logmgr_provider_bus_update(GObject* self, GHashTable* rowData, const ch
   if (BuildLists(provider, rowData, &lists) != 0) return Fail(table, error, table->updateFailure);
   // No where at all makes the provider refuse the update.
   const char* condition = where != nullptr && where[0] != '\0' ? where : nullptr;
-  if (lists.valueHasComma || !UpdateFits(provider->Config().tableName, lists,
-                                         AutoColumnTexts(provider->Config().columns), condition))
+  if (lists.valueHasComma ||
+      !provider->UpdateFits(lists.columns.c_str(), lists.values.c_str(), condition))
     return Fail(table, error, table->updateFailure);
   DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
   int32_t changed = 0;
@@ -322,7 +322,7 @@ gboolean logmgr_provider_bus_select(GObject* self, const char* columns, const ch
   if (provider == nullptr) return kProviderMissing;
   // where and order are accepted and ignored: every row of the table is returned, deliberately.
   // A failed select answers -1 without an error, as the binding reports it.
-  if (columns == nullptr || !SelectFits(provider->Config().tableName, columns, nullptr)) return -1;
+  if (columns == nullptr || !provider->SelectFits(columns, nullptr)) return -1;
   uid_t caller = 0;
   bool known = CallerUid(&caller);
   QueryRows rows;
@@ -349,7 +349,7 @@ gboolean logmgr_provider_bus_delete(GObject* self, const char* where, gint* coun
     return Fail(table, error, kImproperValues);
   int32_t deleted = 0;
   int result = -1;
-  if (where != nullptr && DeleteFits(provider->Config().tableName, where)) {
+  if (where != nullptr && provider->DeleteFits(where)) {
     DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
     if (scope.Held()) result = provider->DeleteRows(where, &deleted);
   }
