@@ -4,11 +4,11 @@
 #include <stdlib.h>
 #include <string.h>
 #include <strings.h>
-#include <sys/time.h>
 #include <unistd.h>
 
 #include <atomic>
 
+#include "base/clock.h"
 #include "include/db_connection.h"
 #include "providers/local_zone.h"
 #include "providers/statement_buffer.h"
@@ -25,12 +25,6 @@ constexpr int kTrimBatch = 500;
 constexpr long long kMsPerDay = 86400000LL;
 // Where a survey table's update cuts its lists.
 constexpr char kUpdateDelims[] = ",";
-
-long long NowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
 
 DbConnection* SurveyConnection() {
   DbManager* manager = DbManager::GetInstance();
@@ -170,7 +164,7 @@ void BaseLogProvider::AppendAutoColumns(std::string* columns, std::string* value
     if (column[0] != 't') continue;  // neither automatic column
     if (column == "timestamp") {
       columns->append(",timestamp");
-      AppendCommaAndNumber(values, NowMs());
+      AppendCommaAndNumber(values, WallClockMs());
     } else if (column == "time_zone") {
       std::string zone;
       if (!LocalZoneLiteral(&zone)) continue;  // unreadable or no zone
@@ -212,7 +206,8 @@ int BaseLogProvider::DeleteExpiredRows() {
   if (conn == nullptr) return 0;
   char where[50];
   snprintf(where, sizeof(where), "timestamp < %lld",
-           NowMs() - static_cast<long long>(config.retention_days) * kMsPerDay);
+           static_cast<long long>(WallClockMs()) -
+               static_cast<long long>(config.retention_days) * kMsPerDay);
   char sql[kStatementSize];
   (void)BuildDelete(config.tableName, where, sql);
   return conn->Exec(sql) == 0 ? 0 : -1;

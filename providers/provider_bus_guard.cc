@@ -15,6 +15,11 @@ namespace _CorvaneLogManager {
 
 namespace {
 
+// The mark after the last row of a select result in the caller's segment.
+constexpr char kSegmentEnd = '&';
+// A default pipe's capacity: one chunk passes the pipe in one write.
+constexpr size_t kPipeChunk = 65536;
+
 bool IsAutoColumn(const char* name) {
   return strcmp(name, "timestamp") == 0 || strcmp(name, "time_zone") == 0;
 }
@@ -102,7 +107,7 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, const QueryRows& rows) {
   // them in parts).
   int fds[2] = {-1, -1};
   if (ok && pipe2(fds, O_CLOEXEC | O_NONBLOCK) != 0) ok = false;
-  char chunk[65536];
+  char chunk[kPipeChunk];
   size_t staged = 0;
   size_t written = 0;
   auto stage = [&](const char* data, size_t length) {
@@ -120,7 +125,7 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, const QueryRows& rows) {
     }
   };
   for (int i = 0; ok && i < rows.count; ++i) stage(rows[i], strlen(rows[i]) + 1);
-  stage("&", 1);
+  stage(&kSegmentEnd, 1);
   if (ok && staged > 0)
     ok = CopyThroughKernel(fds, static_cast<char*>(base) + written, chunk, staged);
   if (fds[0] >= 0) {

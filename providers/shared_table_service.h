@@ -37,8 +37,6 @@ class SharedTableService {
   // rules; null for another name.
   static const SharedTableService* ForTable(const char* tableName);
 
-  const char* TableName() const { return tableName; }
-
   // An insert needs app_id and feature. The status table keeps one row per (app_id, feature):
   // an existing pair is updated and its _id answered, more than one leaves the table as it is.
   Result Insert(const RowData& rowData, int32_t* lastRowId) const;

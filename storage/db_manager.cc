@@ -31,6 +31,10 @@ void InitializeAll(const std::vector<IDbResponseListener*>& listeners) {
 
 }  // namespace
 
+DatabaseOwner::DatabaseOwner() = default;
+
+DatabaseOwner::~DatabaseOwner() = default;
+
 void DatabaseOwner::AddListener(IDbResponseListener* listener) { listeners.push_back(listener); }
 
 void DatabaseOwner::RemoveListener(IDbResponseListener* listener) {
@@ -47,7 +51,7 @@ DbManager* DbManager::GetInstance() {
   if (g_dbManager != nullptr) return g_dbManager;
   DbManager* manager = new (std::nothrow) DbManager();
   if (manager == nullptr) return nullptr;
-  manager->connection = new (std::nothrow) DbConnection();
+  manager->connection.reset(new (std::nothrow) DbConnection());
   // The manager is abandoned, not freed, on this out-of-memory path (deliberate).
   if (manager->connection == nullptr) return nullptr;
   g_dbManager = manager;
@@ -61,15 +65,12 @@ void DbManager::CloseInstance() {
 
 DbManager::~DbManager() {
   listeners.clear();
-  if (connection != nullptr) {
-    (void)connection->Close();
-    delete connection;
-  }
+  if (connection != nullptr) (void)connection->Close();
 }
 
 int DbManager::Init() {
   // The connection exists whenever GetInstance handed out the manager.
-  if (OpenFixed(connection, kSurveyDbPath) != 0) return -1;
+  if (OpenFixed(connection.get(), kSurveyDbPath) != 0) return -1;
   InitializeAll(listeners);
   return 0;
 }
@@ -83,7 +84,7 @@ UploadDbManager* UploadDbManager::GetInstance() {
   if (g_uploadDbManager != nullptr) return g_uploadDbManager;
   UploadDbManager* manager = new (std::nothrow) UploadDbManager();
   if (manager == nullptr) return nullptr;
-  manager->connection = new (std::nothrow) DbConnection();
+  manager->connection.reset(new (std::nothrow) DbConnection());
   if (manager->connection == nullptr) return nullptr;  // abandoned, as above
   g_uploadDbManager = manager;
   return manager;
@@ -97,7 +98,6 @@ void UploadDbManager::CloseInstance() {
 UploadDbManager::~UploadDbManager() {
   listeners.clear();
   (void)CloseConnection();
-  delete connection;
 }
 
 int UploadDbManager::CloseConnection() {
@@ -107,7 +107,7 @@ int UploadDbManager::CloseConnection() {
 
 int UploadDbManager::Init() {
   if (connection == nullptr) return -1;
-  if (OpenFixed(connection, kUploadDbPath) != 0) return -1;
+  if (OpenFixed(connection.get(), kUploadDbPath) != 0) return -1;
   InitializeAll(listeners);
   return 0;
 }

@@ -32,11 +32,11 @@ StatusSnapshotStore* StatusSnapshotStore::GetInstance() {
   // Registered before opening: a failed open still leaves this instance for later callers,
   // who tolerate its failing operations. Deliberate.
   g_store = store;
-  store->connection = new (std::nothrow) DbConnection();
+  store->connection.reset(new (std::nothrow) DbConnection());
   if (store->connection == nullptr) return nullptr;
   char buf[PATH_MAX];
   if (store->connection->Open(logmgr_fixed_path(kDbPath, buf, sizeof(buf))) != 0) return nullptr;
-  DbConnection::SetupScope setup(store->connection);
+  DbConnection::SetupScope setup(store->connection.get());
   if (store->connection->Exec(kCreateSql) != 0) return nullptr;
   return store;
 }
@@ -47,10 +47,7 @@ void StatusSnapshotStore::DestroyInstance() {
 }
 
 StatusSnapshotStore::~StatusSnapshotStore() {
-  if (connection != nullptr) {
-    (void)connection->Close();
-    delete connection;
-  }
+  if (connection != nullptr) (void)connection->Close();
 }
 
 int StatusSnapshotStore::Put(const char* feature, const char* extra, int64_t timestamp) {
