@@ -192,7 +192,7 @@ gboolean Fail(const BusTable* table, GError** error, const char* message) {
   return FALSE;
 }
 
-// The bus answer to a failed request: the error each failure gets from this table.
+// The bus answer to a result: success, or the error each failure gets from this table.
 gboolean Answer(const BusTable* table, SharedTableService::Result result, GError** error) {
   switch (result) {
     case SharedTableService::Result::kOk:
@@ -232,9 +232,12 @@ SharedTableService::RowData Unpack(GHashTable* rowData) {
   gpointer value = nullptr;
   g_hash_table_iter_init(&iter, rowData);
   while (g_hash_table_iter_next(&iter, &key, &value)) {
-    // a{ss} never carries a null; a missing text would be refused as no declared column.
-    entries.emplace_back(key != nullptr ? static_cast<const char*>(key) : "",
-                         value != nullptr ? static_cast<const char*>(value) : "");
+    // a{ss} never carries a null; were one there, the entry names no column and is refused.
+    if (key == nullptr || value == nullptr) {
+      entries.emplace_back();
+      continue;
+    }
+    entries.emplace_back(static_cast<const char*>(key), static_cast<const char*>(value));
   }
   return entries;
 }

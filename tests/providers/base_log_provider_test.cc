@@ -33,10 +33,10 @@ TEST_F(BaseLogProviderTest, InsertAppendsTimestampAndZoneOrLeavesZoneNull) {
   for (const auto& c : cases) {
     SCOPED_TRACE(c.link);
     SetLocaltimeLink(c.link);
-    long long before = TestNowMs();
+    long long before = WallClockMs();
     int32_t rowId = 0;
     ASSERT_EQ(useApp->InsertRow("app_id,duration", "'com.example',12", &rowId), 0);
-    long long after = TestNowMs();
+    long long after = WallClockMs();
     std::vector<std::string> run = Taken("INSERT");
     ASSERT_EQ(run.size(), 1u);
     std::string zone;
@@ -142,7 +142,7 @@ TEST_F(BaseLogProviderTest, ExpiryKeepsStatusTenDaysAndTheRestThree) {
   const long long day = 86400000LL, hour = 3600000LL;
   const char* tables[] = {"use_app_survey", "manage_app_survey", "report_app_error_survey",
                           "use_app_feature_survey", "report_app_status_survey"};
-  long long now = TestNowMs();
+  long long now = WallClockMs();
   for (const char* table : tables)
     for (long long age : {3 * day - hour, 3 * day + hour, 10 * day - hour, 10 * day + hour})
       Fill(survey, table, "timestamp", std::to_string(now - age), 1);
