@@ -1,5 +1,6 @@
-// Fixed-buffer helpers shared by the providers. A list or an appended clause that would not
-// fit ends the process (abort) before anything is written past the buffer.
+// Fixed-buffer helpers shared by the providers. Nothing is ever written past a buffer: a list
+// or an appended clause that would not fit is reported (the ...Fits helpers, which the
+// statement builder uses to answer whether a request fits) or ends the process (...OrDie).
 #ifndef LOGMGR_PROVIDERS_STATEMENT_BUFFER_H_
 #define LOGMGR_PROVIDERS_STATEMENT_BUFFER_H_
 
