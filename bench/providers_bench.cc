@@ -6,13 +6,13 @@
 #include <stdio.h>
 #include <stdlib.h>
 #include <sys/stat.h>
-#include <sys/time.h>
 #include <time.h>
 #include <unistd.h>
 
 #include <map>
 #include <string>
 
+#include "base/clock.h"
 #include "bench/ratio_reporter.h"
 #include "include/base_log_provider.h"
 #include "include/db_connection.h"
@@ -64,12 +64,6 @@ void Prefill(int rows) {
   (void)g_provider->Initialize();
 }
 
-long long NowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
-
 // Keeps an "empty" table near empty between batches (untimed).
 void MaybeEmpty(benchmark::State& state, int start, int64_t done) {
   if (start == 0 && done % kBatch == 0) {
@@ -104,7 +98,7 @@ void BM_BarePreparedInsert(benchmark::State& state) {
   for (auto _ : state) {
     sqlite3_bind_text(stmt, 1, "com.example.clock", -1, SQLITE_STATIC);
     sqlite3_bind_int64(stmt, 2, 184230);
-    sqlite3_bind_int64(stmt, 3, NowMs());
+    sqlite3_bind_int64(stmt, 3, WallClockMs());
     sqlite3_bind_text(stmt, 4, "Europe/Berlin", -1, SQLITE_STATIC);
     if (sqlite3_step(stmt) != SQLITE_DONE) state.SkipWithError("insert failed");
     sqlite3_reset(stmt);
@@ -171,7 +165,7 @@ void BM_InsertRowInterleavedWithBare(benchmark::State& state) {
     double cpu = CpuUs(), wall = WallUs();
     sqlite3_bind_text(stmt, 1, "com.example.clock", -1, SQLITE_STATIC);
     sqlite3_bind_int64(stmt, 2, 184230);
-    sqlite3_bind_int64(stmt, 3, NowMs());
+    sqlite3_bind_int64(stmt, 3, WallClockMs());
     sqlite3_bind_text(stmt, 4, "Europe/Berlin", -1, SQLITE_STATIC);
     if (sqlite3_step(stmt) != SQLITE_DONE) state.SkipWithError("insert failed");
     sqlite3_reset(stmt);

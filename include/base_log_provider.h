@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "include/db_connection.h"
+#include "storage/db_response_listener.h"
 
 namespace _CorvaneLogManager {
 
@@ -19,12 +20,6 @@ namespace _CorvaneLogManager {
 // decoded into |decoded|; the count, or -1 for anything else (the text path serves it).
 int ParsePlainLiterals(const char* text, DbConnection::BoundValue* out, int room, char* decoded,
                        size_t decodedSize);
-
-// What a database manager keeps of the providers whose tables live in its file.
-class IDbResponseListener {
- public:
-  virtual ~IDbResponseListener() {}
-};
 
 struct TableConfig {
   std::string tableName;
@@ -43,11 +38,11 @@ class BaseLogProvider : public IDbResponseListener {
   BaseLogProvider() = default;
   ~BaseLogProvider() override = default;
 
-  // Keep these virtual operations in this order: the vtable layout is part of the interface.
+  // Keep these virtual operations in this order: the vtable layout is part of the interface
+  // (Initialize, EmptyHook and DeleteExpiredRows come first, from IDbResponseListener).
   // Creates the table; returns the reseeded insert counter (0..499) or -1.
-  virtual int Initialize();
-  virtual void EmptyHook() {}
-  virtual int DeleteExpiredRows();
+  int Initialize() override;
+  int DeleteExpiredRows() override;
   virtual int InsertRow(const char* columns, const char* values, int32_t* rowId = nullptr);
   virtual int UpdateRows(const char* columns, const char* values, const char* where,
                          int32_t* count = nullptr);
@@ -62,6 +57,14 @@ class BaseLogProvider : public IDbResponseListener {
   virtual const char* GetTableName() = 0;
   virtual int GetRowCount();
   virtual int DeleteOldestRows();
+
+  // Whether each statement these arguments make (with timestamp and time_zone as they would be
+  // now) comes out of its fixed buffer whole. A cut statement would run as cut and a list past
+  // its buffer ends the process, so requests from other processes are asked about first.
+  bool InsertFits(const char* columns, const char* values);
+  bool UpdateFits(const char* columns, const char* values, const char* where);
+  bool SelectFits(const char* columns, const char* where);
+  bool DeleteFits(const char* where);
 
   const TableConfig& Config() const { return config; }
 

@@ -5,6 +5,7 @@
 #include <stddef.h>
 
 #include <map>
+#include <memory>
 #include <string>
 
 namespace _CorvaneLogManager {
@@ -36,14 +37,17 @@ class ProviderRegistry {
   ProviderRegistry() = default;
   ~ProviderRegistry();
   void Teardown();
+  // Frees the providers, in the order they were registered.
+  void FreeProviders();
 
+  // Owned here; the map only names them.
   std::map<std::string, BaseLogProvider*> providers;
-  UseAppSurveyLogProvider* useApp = nullptr;
-  UseAppFeatureSurveyLogProvider* useAppFeature = nullptr;
-  ReportAppStatusSurveyLogProvider* reportAppStatus = nullptr;
-  AppErrorSurveyLogProvider* appError = nullptr;
-  ManageAppSurveyLogProvider* manageApp = nullptr;
-  ServerUploadLogProvider* serverUpload = nullptr;
+  std::unique_ptr<UseAppSurveyLogProvider> useApp;
+  std::unique_ptr<UseAppFeatureSurveyLogProvider> useAppFeature;
+  std::unique_ptr<ReportAppStatusSurveyLogProvider> reportAppStatus;
+  std::unique_ptr<AppErrorSurveyLogProvider> appError;
+  std::unique_ptr<ManageAppSurveyLogProvider> manageApp;
+  std::unique_ptr<ServerUploadLogProvider> serverUpload;
 };
 
 }  // namespace _CorvaneLogManager

@@ -1,16 +1,18 @@
 #include "include/base_log_provider.h"
 
 #include <stdio.h>
+#include <stdlib.h>
 #include <string.h>
 #include <strings.h>
-#include <sys/time.h>
 #include <unistd.h>
 
 #include <atomic>
 
+#include "base/clock.h"
 #include "include/db_connection.h"
 #include "providers/local_zone.h"
 #include "providers/statement_buffer.h"
+#include "providers/statement_builder.h"
 #include "storage/db_manager.h"
 
 namespace _CorvaneLogManager {
@@ -21,12 +23,8 @@ namespace {
 // table's own check interval says.
 constexpr int kTrimBatch = 500;
 constexpr long long kMsPerDay = 86400000LL;
-
-long long NowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
+// Where a survey table's update cuts its lists.
+constexpr char kUpdateDelims[] = ",";
 
 DbConnection* SurveyConnection() {
   DbManager* manager = DbManager::GetInstance();
@@ -166,7 +164,7 @@ void BaseLogProvider::AppendAutoColumns(std::string* columns, std::string* value
     if (column[0] != 't') continue;  // neither automatic column
     if (column == "timestamp") {
       columns->append(",timestamp");
-      AppendCommaAndNumber(values, NowMs());
+      AppendCommaAndNumber(values, WallClockMs());
     } else if (column == "time_zone") {
       std::string zone;
       if (!LocalZoneLiteral(&zone)) continue;  // unreadable or no zone
@@ -208,9 +206,10 @@ int BaseLogProvider::DeleteExpiredRows() {
   if (conn == nullptr) return 0;
   char where[50];
   snprintf(where, sizeof(where), "timestamp < %lld",
-           NowMs() - static_cast<long long>(config.retention_days) * kMsPerDay);
+           static_cast<long long>(WallClockMs()) -
+               static_cast<long long>(config.retention_days) * kMsPerDay);
   char sql[kStatementSize];
-  snprintf(sql, sizeof(sql), "DELETE FROM %s WHERE %s;", config.tableName.c_str(), where);
+  (void)BuildDelete(config.tableName, where, sql);
   return conn->Exec(sql) == 0 ? 0 : -1;
 }
 
@@ -233,15 +232,13 @@ int BaseLogProvider::InsertOn(DbConnection* conn, const char* columns, const cha
   AppendAutoColumns(&columnText, &valueText);
   int32_t check = countRows ? TickInsertCounter() : 0;
 
-  char sql[kStatementSize];
-  size_t length = sizeof("INSERT INTO () VALUES ();") - 1 + config.tableName.size() +
-                  columnText.size() + valueText.size();
   int result = DbConnection::kNotRun;
   // Only a text that fits the buffer may be served otherwise; a cut one is run as cut.
-  if (length < sizeof(sql)) result = InsertKept(conn, columnText.c_str(), valueText.c_str());
+  if (InsertLength(config.tableName, columnText.size(), valueText.size()) < kStatementSize)
+    result = InsertKept(conn, columnText.c_str(), valueText.c_str());
   if (result == DbConnection::kNotRun) {
-    snprintf(sql, sizeof(sql), "INSERT INTO %s(%s) VALUES (%s);", config.tableName.c_str(),
-             columnText.c_str(), valueText.c_str());
+    char sql[kStatementSize];
+    (void)BuildInsert(config.tableName, columnText.c_str(), valueText.c_str(), sql);
     result = conn->Exec(sql);
   }
   if (rowId != nullptr) *rowId = result == 0 ? conn->LastInsertRowId() : -1;
@@ -279,7 +276,7 @@ int BaseLogProvider::InsertKept(DbConnection* conn, const char* columns, const c
 
 int BaseLogProvider::UpdateRows(const char* columns, const char* values, const char* where,
                                 int32_t* count) {
-  return UpdateOn(SurveyConnection(), columns, values, where, count, true, ",");
+  return UpdateOn(SurveyConnection(), columns, values, where, count, true, kUpdateDelims);
 }
 
 int BaseLogProvider::UpdateOn(DbConnection* conn, const char* columns, const char* values,
@@ -292,29 +289,11 @@ int BaseLogProvider::UpdateOn(DbConnection* conn, const char* columns, const cha
   if (ValidateColumns(columnText.c_str()) != 0) return -1;
   if (autoColumns) AppendAutoColumns(&columnText, &valueText);
 
-  char columnBuf[kListSize];
-  char valueBuf[kListSize];
-  CopyListOrDie(columnBuf, columnText.c_str());
-  CopyListOrDie(valueBuf, valueText.c_str());
-
-  char set[kStatementSize] = "";
-  char* columnSave = nullptr;
-  char* valueSave = nullptr;
-  char* column = strtok_r(columnBuf, splitDelims, &columnSave);
-  char* value = strtok_r(valueBuf, splitDelims, &valueSave);
-  // Surplus tokens of the longer list are ignored; a value holding a delimiter is split.
-  while (column != nullptr && value != nullptr) {
-    char pair[kStatementSize];
-    snprintf(pair, sizeof(pair), value[0] == '\'' ? "%s = %s," : "%s = '%s',", column, value);
-    AppendOrDie(set, sizeof(set), pair);
-    column = strtok_r(nullptr, splitDelims, &columnSave);
-    value = strtok_r(nullptr, splitDelims, &valueSave);
-  }
-  size_t setLen = strlen(set);
-  if (setLen > 0) set[setLen - 1] = '\0';
-
   char sql[kStatementSize];
-  snprintf(sql, sizeof(sql), "UPDATE %s SET %s WHERE %s;", config.tableName.c_str(), set, where);
+  // A list or the SET text past its buffer ends the process; a cut statement runs as cut.
+  if (BuildUpdate(config.tableName, columnText.c_str(), valueText.c_str(), where, splitDelims,
+                  sql) == StatementFit::kOverflow)
+    abort();
   int result = conn->Exec(sql);
   if (count != nullptr) *count = result == 0 ? conn->Changes() : 0;
   return result == 0 ? 0 : -1;
@@ -330,12 +309,8 @@ int BaseLogProvider::SelectGroupedRows(const char* columns, const char* where, c
   DbConnection* conn = SurveyConnection();
   if (conn == nullptr) return -1;
   char sql[kStatementSize];
-  snprintf(sql, sizeof(sql), "SELECT %s FROM %s", columns == nullptr ? "*" : columns,
-           config.tableName.c_str());
-  AppendClauseOrDie(sql, sizeof(sql), " WHERE %s", where);
-  AppendClauseOrDie(sql, sizeof(sql), " GROUP BY %s", groupBy);
-  AppendClauseOrDie(sql, sizeof(sql), " ORDER BY %s", orderBy);
-  AppendOrDie(sql, sizeof(sql), ";");
+  if (BuildSelect(config.tableName, columns, where, groupBy, orderBy, sql) != StatementFit::kWhole)
+    abort();
   return conn->Select(sql, config.tableName.c_str(), rowCount, rows);
 }
 
@@ -346,10 +321,33 @@ int BaseLogProvider::DeleteRows(const char* where, int32_t* count) {
 int BaseLogProvider::DeleteOn(DbConnection* conn, const char* where, int32_t* count) {
   if (conn == nullptr || where == nullptr) return -1;
   char sql[kStatementSize];
-  snprintf(sql, sizeof(sql), "DELETE FROM %s WHERE %s;", config.tableName.c_str(), where);
+  (void)BuildDelete(config.tableName, where, sql);
   int result = conn->Exec(sql);
   if (count != nullptr) *count = result == 0 ? conn->Changes() : 0;
   return result == 0 ? 0 : -1;
+}
+
+bool BaseLogProvider::InsertFits(const char* columns, const char* values) {
+  std::string autoColumns;
+  std::string autoValues;
+  AppendAutoColumns(&autoColumns, &autoValues);
+  return InsertStatementFits(config.tableName, columns, values, autoColumns, autoValues);
+}
+
+bool BaseLogProvider::UpdateFits(const char* columns, const char* values, const char* where) {
+  std::string autoColumns;
+  std::string autoValues;
+  AppendAutoColumns(&autoColumns, &autoValues);
+  return UpdateStatementFits(config.tableName, columns, values, autoColumns, autoValues, where,
+                             kUpdateDelims);
+}
+
+bool BaseLogProvider::SelectFits(const char* columns, const char* where) {
+  return SelectStatementFits(config.tableName, columns, where);
+}
+
+bool BaseLogProvider::DeleteFits(const char* where) {
+  return DeleteStatementFits(config.tableName, where);
 }
 
 int BaseLogProvider::GetRowCount() {

@@ -7,38 +7,21 @@
 #include <sys/ipc.h>
 #include <sys/shm.h>
 #include <sys/stat.h>
-#include <sys/time.h>
 #include <unistd.h>
 
-#include "providers/local_zone.h"
-#include "providers/statement_buffer.h"
+#include "include/db_connection.h"
 
 namespace _CorvaneLogManager {
 
 namespace {
 
+// The mark after the last row of a select result in the caller's segment.
+constexpr char kSegmentEnd = '&';
+// A default pipe's capacity: one chunk passes the pipe in one write.
+constexpr size_t kPipeChunk = 65536;
+
 bool IsAutoColumn(const char* name) {
   return strcmp(name, "timestamp") == 0 || strcmp(name, "time_zone") == 0;
-}
-
-// Length of the SET text the provider makes of these lists: both cut at commas (empty pieces
-// skipped) and paired in step, each pair "c = v," or "c = 'v',".
-size_t SetLength(const std::string& columns, const std::string& values) {
-  std::vector<std::string> cols;
-  std::vector<std::string> vals;
-  for (auto [text, out] : {std::make_pair(&columns, &cols), std::make_pair(&values, &vals)}) {
-    size_t start = 0;
-    while (start <= text->size()) {
-      size_t end = text->find(',', start);
-      if (end == std::string::npos) end = text->size();
-      if (end > start) out->push_back(text->substr(start, end - start));
-      start = end + 1;
-    }
-  }
-  size_t length = 0;
-  for (size_t i = 0; i < cols.size() && i < vals.size(); ++i)
-    length += cols[i].size() + 4 + vals[i].size() + (vals[i][0] == '\'' ? 0 : 2);
-  return length;
 }
 
 bool IsCallerRowId(const char* value) {
@@ -100,61 +83,9 @@ int AppendRowEntry(const std::vector<std::string>& declared, const char* key, co
   return 0;
 }
 
-BusRowLists AutoColumnTexts(const std::vector<std::string>& declared) {
-  BusRowLists texts;
-  for (const std::string& column : declared) {
-    if (column == "timestamp") {
-      struct timeval tv;
-      gettimeofday(&tv, nullptr);
-      char now[32];
-      snprintf(now, sizeof(now), ",%lld",
-               static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000);
-      texts.columns.append(",timestamp");
-      texts.values.append(now);
-    } else if (column == "time_zone") {
-      std::string zone;
-      if (!LocalZoneLiteral(&zone)) continue;
-      texts.columns.append(",time_zone");
-      texts.values.append(",").append(zone);
-    }
-  }
-  return texts;
-}
-
-bool InsertFits(const std::string& table, const BusRowLists& lists, const BusRowLists& autoTexts) {
-  if (lists.columns.size() >= kListSize) return false;
-  size_t statement = strlen("INSERT INTO () VALUES ();") + table.size() + lists.columns.size() +
-                     autoTexts.columns.size() + lists.values.size() + autoTexts.values.size();
-  return statement < kStatementSize;
-}
-
-bool UpdateFits(const std::string& table, const BusRowLists& lists, const BusRowLists& autoTexts,
-                const char* where) {
-  if (where == nullptr) return true;  // the provider refuses it before building anything
-  std::string columns = lists.columns + autoTexts.columns;
-  std::string values = lists.values + autoTexts.values;
-  if (columns.size() >= kListSize || values.size() >= kListSize) return false;
-  // The SET text is built with a trailing comma, which is dropped before the statement.
-  size_t set = SetLength(columns, values);
-  if (set >= kStatementSize) return false;
-  if (set > 0) --set;
-  size_t statement = strlen("UPDATE  SET  WHERE ;") + table.size() + set + strlen(where);
-  return statement < kStatementSize;
-}
-
-bool SelectFits(const std::string& table, const char* columns, const char* where) {
-  size_t statement = strlen("SELECT  FROM ;") + table.size() + strlen(columns);
-  if (where != nullptr) statement += strlen(" WHERE ") + strlen(where);
-  return statement < kStatementSize;
-}
-
-bool DeleteFits(const std::string& table, const char* where) {
-  return strlen("DELETE FROM  WHERE ;") + table.size() + strlen(where) < kStatementSize;
-}
-
-size_t SegmentBytes(char** rows, int rowCount) {
+size_t SegmentBytes(const QueryRows& rows) {
   size_t bytes = 1;
-  for (int i = 0; i < rowCount; ++i) bytes += strlen(rows[i]) + 1;
+  for (int i = 0; i < rows.count; ++i) bytes += strlen(rows[i]) + 1;
   return bytes;
 }
 
@@ -165,18 +96,18 @@ size_t SegmentRoom(int shmId, uid_t callerUid) {
   return info.shm_segsz;
 }
 
-int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
+int WriteRowsToSegment(int shmId, uid_t callerUid, const QueryRows& rows) {
   // Attached first and checked after: an attached segment keeps its id, so what is checked is
   // what is written, even if the caller removes it and makes another meanwhile.
   void* base = shmat(shmId, nullptr, 0);
   if (base == reinterpret_cast<void*>(-1)) return -1;
-  size_t bytes = SegmentBytes(rows, rowCount);
+  size_t bytes = SegmentBytes(rows);
   bool ok = bytes <= SegmentRoom(shmId, callerUid);
   // One pipe for the whole result; chunks of a default pipe's capacity (a smaller pipe takes
   // them in parts).
   int fds[2] = {-1, -1};
   if (ok && pipe2(fds, O_CLOEXEC | O_NONBLOCK) != 0) ok = false;
-  char chunk[65536];
+  char chunk[kPipeChunk];
   size_t staged = 0;
   size_t written = 0;
   auto stage = [&](const char* data, size_t length) {
@@ -193,8 +124,8 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
       }
     }
   };
-  for (int i = 0; ok && i < rowCount; ++i) stage(rows[i], strlen(rows[i]) + 1);
-  stage("&", 1);
+  for (int i = 0; ok && i < rows.count; ++i) stage(rows[i], strlen(rows[i]) + 1);
+  stage(&kSegmentEnd, 1);
   if (ok && staged > 0)
     ok = CopyThroughKernel(fds, static_cast<char*>(base) + written, chunk, staged);
   if (fds[0] >= 0) {
@@ -203,12 +134,6 @@ int WriteRowsToSegment(int shmId, uid_t callerUid, char** rows, int rowCount) {
   }
   (void)shmdt(base);
   return ok ? 0 : -1;
-}
-
-void FreeRows(char** rows, int rowCount) {
-  if (rows == nullptr) return;
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
 }
 
 }  // namespace _CorvaneLogManager

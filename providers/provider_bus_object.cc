@@ -7,17 +7,12 @@
 #include <dbus/dbus.h>
 #include <glib-object.h>
 #include <stdio.h>
-#include <stdlib.h>
 #include <string.h>
 
 #include <string>
 
-#include "include/base_log_provider.h"
-#include "include/db_connection.h"
-#include "include/provider_registry.h"
-#include "providers/provider_bus_guard.h"
 #include "providers/sender_uid_cache.h"
-#include "storage/db_manager.h"
+#include "providers/shared_table_service.h"
 
 namespace {
 
@@ -42,40 +37,37 @@ using namespace _CorvaneLogManager;
 constexpr char kImproperValues[] = "Improper Values Provided";
 constexpr char kInsertFailed[] = "Insert API Failed";
 constexpr char kApiFailed[] = "API Failed";
+constexpr char kDeleteFailed[] = "Delete API Failed";
 constexpr gint kErrorCode = 1;
 // Result of every handler when the table's provider is gone: non-zero, so the binding reports
 // success with empty outputs. Deliberate.
 constexpr gboolean kProviderMissing = -1;
+// A select that ran nothing answers this, without an error, as the binding reports it.
+constexpr gboolean kSelectFailed = -1;
 
 // The key path callers historically derived their segment key from; kept beside each object,
 // never read by the daemon.
 const std::string kUseAppFeatureShmPath = "/home/developer/.shm_log_mgr";
 const std::string kReportAppStatusShmPath = "/home/developer/.shm_log_mgr";
 
-enum class InsertMode { kPlain, kUpsertOnAppFeature };
-
+// What the request rules (SharedTableService) leave to the bus: names, paths and error texts.
 struct BusTable {
   const char* tableName;  // also the provider's registry key
   const char* typeName;
   const char* objectPath;
   const char* errorDomain;
   const DBusGObjectInfo* info;
-  InsertMode insert;
   const char* updateFailure;
-  bool deleteNeedsWhere;      // an empty where is refused with kImproperValues
-  bool deleteFailureIsError;  // otherwise a failed delete succeeds with count 0
   const std::string* shmPath;
 };
 
 const BusTable kBusTables[] = {
     {"use_app_feature_survey", "LogProviderInterfaceUseAppFeatureSurvey",
      "/com/corvane/logmgr/log/provider/use_app_feature_survey", "g-logmgr-useappfeature-error",
-     &dbus_glib_use_app_feature_survey_object_info, InsertMode::kPlain, "Update API Failed", true,
-     true, &kUseAppFeatureShmPath},
+     &dbus_glib_use_app_feature_survey_object_info, "Update API Failed", &kUseAppFeatureShmPath},
     {"report_app_status_survey", "LogProviderInterfaceReportAppStatusSurvey",
      "/com/corvane/logmgr/log/provider/report_app_status_survey", "g-logmgr-reportappstatus-error",
-     &dbus_glib_report_app_status_survey_object_info, InsertMode::kUpsertOnAppFeature,
-     kImproperValues, false, false, &kReportAppStatusShmPath},
+     &dbus_glib_report_app_status_survey_object_info, kImproperValues, &kReportAppStatusShmPath},
 };
 constexpr size_t kTableCount = sizeof(kBusTables) / sizeof(kBusTables[0]);
 
@@ -200,169 +192,88 @@ gboolean Fail(const BusTable* table, GError** error, const char* message) {
   return FALSE;
 }
 
-BaseLogProvider* LookupProvider(const BusTable* table) {
-  ProviderRegistry* registry = ProviderRegistry::GetInstance();
-  return registry == nullptr ? nullptr : registry->Lookup(table->tableName);
+// The bus answer to a result: success, or the error each failure gets from this table.
+gboolean Answer(const BusTable* table, SharedTableService::Result result, GError** error) {
+  switch (result) {
+    case SharedTableService::Result::kOk:
+      return TRUE;
+    case SharedTableService::Result::kProviderMissing:
+      return kProviderMissing;
+    case SharedTableService::Result::kImproperValues:
+      return Fail(table, error, kImproperValues);
+    case SharedTableService::Result::kInsertFailed:
+      return Fail(table, error, kInsertFailed);
+    case SharedTableService::Result::kUpdateFailed:
+      return Fail(table, error, table->updateFailure);
+    case SharedTableService::Result::kDeleteFailed:
+      return Fail(table, error, kDeleteFailed);
+    case SharedTableService::Result::kApiFailed:
+      return Fail(table, error, kApiFailed);
+    case SharedTableService::Result::kSelectFailed:
+      // A failed select answers -1 without an error, as the binding reports it.
+      return kSelectFailed;
+    case SharedTableService::Result::kNotWritten:
+      return FALSE;
+  }
+  return FALSE;
 }
 
-DbConnection* SurveyConnection() {
-  DbManager* manager = DbManager::GetInstance();
-  return manager == nullptr ? nullptr : manager->GetConnection();
+const SharedTableService* ServiceOf(GObject* object, const BusTable** table) {
+  *table = TableOf(object);
+  return *table == nullptr ? nullptr : SharedTableService::ForTable((*table)->tableName);
 }
 
-// row_data as the provider's column and value lists; -1 when an entry is refused.
-int BuildLists(BaseLogProvider* provider, GHashTable* rowData, BusRowLists* lists) {
-  if (rowData == nullptr) return 0;
+// row_data in the order the hash table hands it out.
+SharedTableService::RowData Unpack(GHashTable* rowData) {
+  SharedTableService::RowData entries;
+  if (rowData == nullptr) return entries;
   GHashTableIter iter;
   gpointer key = nullptr;
   gpointer value = nullptr;
   g_hash_table_iter_init(&iter, rowData);
   while (g_hash_table_iter_next(&iter, &key, &value)) {
-    if (AppendRowEntry(provider->Config().columns, static_cast<const char*>(key),
-                       static_cast<const char*>(value), lists) != 0)
-      return -1;
+    // a{ss} never carries a null; were one there, the entry names no column and is refused.
+    if (key == nullptr || value == nullptr) {
+      entries.emplace_back();
+      continue;
+    }
+    entries.emplace_back(static_cast<const char*>(key), static_cast<const char*>(value));
   }
-  return 0;
-}
-
-bool HasKey(GHashTable* rowData, const char* key) {
-  return rowData != nullptr && g_hash_table_lookup(rowData, key) != nullptr;
-}
-
-gboolean PlainInsert(const BusTable* table, BaseLogProvider* provider, const BusRowLists& lists,
-                     gint* lastRowId, GError** error) {
-  if (!InsertFits(provider->Config().tableName, lists, AutoColumnTexts(provider->Config().columns)))
-    return Fail(table, error, kImproperValues);
-  DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
-  int32_t rowId = -1;
-  if (!scope.Held() ||
-      provider->InsertRow(lists.columns.c_str(), lists.values.c_str(), &rowId) == -1)
-    return Fail(table, error, kInsertFailed);
-  *lastRowId = rowId;
-  return TRUE;
-}
-
-// One row per (app_id, feature): an existing row is updated, a missing one inserted.
-gboolean UpsertInsert(const BusTable* table, BaseLogProvider* provider, GHashTable* rowData,
-                      const BusRowLists& lists, gint* lastRowId, GError** error) {
-  std::string condition =
-      std::string("app_id='") + static_cast<const char*>(g_hash_table_lookup(rowData, "app_id")) +
-      "' and feature='" + static_cast<const char*>(g_hash_table_lookup(rowData, "feature")) + "'";
-  const std::string& tableName = provider->Config().tableName;
-  BusRowLists autoTexts = AutoColumnTexts(provider->Config().columns);
-  // The update's 200-byte lists and its comma split only matter when the pair exists.
-  if (!SelectFits(tableName, "_id", condition.c_str()) || !InsertFits(tableName, lists, autoTexts))
-    return Fail(table, error, kImproperValues);
-
-  DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
-  if (!scope.Held()) return Fail(table, error, kApiFailed);
-  int rowCount = 0;
-  char** rows = nullptr;
-  int selected = provider->SelectRows("_id", condition.c_str(), nullptr, &rowCount, &rows);
-  long existingId = 0;
-  // The row text ends in a comma, which stops the conversion.
-  if (selected == 0 && rowCount == 1) existingId = strtol(rows[0], nullptr, 10);
-  if (selected == 0) FreeRows(rows, rowCount);
-  if (selected == -1) return Fail(table, error, kApiFailed);
-  if (rowCount == 1) {
-    *lastRowId = static_cast<gint>(existingId);
-    if (lists.valueHasComma || !UpdateFits(tableName, lists, autoTexts, condition.c_str()))
-      return Fail(table, error, kApiFailed);
-    if (provider->UpdateRows(lists.columns.c_str(), lists.values.c_str(), condition.c_str()) == -1)
-      return Fail(table, error, kApiFailed);
-    return TRUE;
-  }
-  if (rowCount > 1) return TRUE;  // ambiguous pair: nothing is written, deliberately
-  int32_t rowId = -1;
-  if (provider->InsertRow(lists.columns.c_str(), lists.values.c_str(), &rowId) == -1)
-    return Fail(table, error, kInsertFailed);
-  *lastRowId = rowId;
-  return TRUE;
+  return entries;
 }
 
 gboolean logmgr_provider_bus_insert(GObject* self, GHashTable* rowData, gint* lastRowId,
                                     GError** error) {
-  const BusTable* table = TableOf(self);
-  if (table == nullptr) return FALSE;
-  BaseLogProvider* provider = LookupProvider(table);
-  if (provider == nullptr) return kProviderMissing;
-  if (!HasKey(rowData, "app_id") || !HasKey(rowData, "feature"))
-    return Fail(table, error, kImproperValues);
-  BusRowLists lists;
-  if (BuildLists(provider, rowData, &lists) != 0) return Fail(table, error, kImproperValues);
-  if (table->insert == InsertMode::kUpsertOnAppFeature)
-    return UpsertInsert(table, provider, rowData, lists, lastRowId, error);
-  return PlainInsert(table, provider, lists, lastRowId, error);
+  const BusTable* table = nullptr;
+  const SharedTableService* service = ServiceOf(self, &table);
+  if (service == nullptr) return FALSE;
+  return Answer(table, service->Insert(Unpack(rowData), lastRowId), error);
 }
 
 gboolean logmgr_provider_bus_update(GObject* self, GHashTable* rowData, const char* where,
                                     gint* count, GError** error) {
-  const BusTable* table = TableOf(self);
-  if (table == nullptr) return FALSE;
-  BaseLogProvider* provider = LookupProvider(table);
-  if (provider == nullptr) return kProviderMissing;
-  BusRowLists lists;
-  if (BuildLists(provider, rowData, &lists) != 0) return Fail(table, error, table->updateFailure);
-  // No where at all makes the provider refuse the update.
-  const char* condition = where != nullptr && where[0] != '\0' ? where : nullptr;
-  if (lists.valueHasComma || !UpdateFits(provider->Config().tableName, lists,
-                                         AutoColumnTexts(provider->Config().columns), condition))
-    return Fail(table, error, table->updateFailure);
-  DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
-  int32_t changed = 0;
-  if (!scope.Held() ||
-      provider->UpdateRows(lists.columns.c_str(), lists.values.c_str(), condition, &changed) == -1)
-    return Fail(table, error, table->updateFailure);
-  *count = changed;
-  return TRUE;
+  const BusTable* table = nullptr;
+  const SharedTableService* service = ServiceOf(self, &table);
+  if (service == nullptr) return FALSE;
+  return Answer(table, service->Update(Unpack(rowData), where, count), error);
 }
 
 gboolean logmgr_provider_bus_select(GObject* self, const char* columns, const char*, const char*,
-                                    guint shmId, GError**) {
-  const BusTable* table = TableOf(self);
-  if (table == nullptr) return FALSE;
-  BaseLogProvider* provider = LookupProvider(table);
-  if (provider == nullptr) return kProviderMissing;
-  // where and order are accepted and ignored: every row of the table is returned, deliberately.
-  // A failed select answers -1 without an error, as the binding reports it.
-  if (columns == nullptr || !SelectFits(provider->Config().tableName, columns, nullptr)) return -1;
+                                    guint shmId, GError** error) {
+  const BusTable* table = nullptr;
+  const SharedTableService* service = ServiceOf(self, &table);
+  if (service == nullptr) return FALSE;
+  // where and order are accepted and ignored (see SharedTableService::Select).
   uid_t caller = 0;
-  bool known = CallerUid(&caller);
-  int rowCount = 0;
-  char** rows = nullptr;
-  {
-    DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
-    if (!scope.Held()) return -1;
-    // Rendering stops where the result stops fitting the segment; a segment that is not the
-    // caller's takes nothing.
-    scope.LimitResult(known ? SegmentRoom(static_cast<int>(shmId), caller) : 0);
-    if (provider->SelectRows(columns, nullptr, nullptr, &rowCount, &rows) != 0)
-      return scope.ResultTooLarge() ? FALSE : -1;
-  }
-  bool written = known && WriteRowsToSegment(static_cast<int>(shmId), caller, rows, rowCount) == 0;
-  FreeRows(rows, rowCount);
-  return written ? TRUE : FALSE;
+  bool known = columns != nullptr && CallerUid(&caller);
+  return Answer(table, service->Select(columns, static_cast<int>(shmId), known, caller), error);
 }
 
 gboolean logmgr_provider_bus_delete(GObject* self, const char* where, gint* count, GError** error) {
-  const BusTable* table = TableOf(self);
-  if (table == nullptr) return FALSE;
-  BaseLogProvider* provider = LookupProvider(table);
-  if (provider == nullptr) return kProviderMissing;
-  if (table->deleteNeedsWhere && (where == nullptr || where[0] == '\0'))
-    return Fail(table, error, kImproperValues);
-  int32_t deleted = 0;
-  int result = -1;
-  if (where != nullptr && DeleteFits(provider->Config().tableName, where)) {
-    DbConnection::BusRequestScope scope(SurveyConnection(), table->tableName);
-    if (scope.Held()) result = provider->DeleteRows(where, &deleted);
-  }
-  if (result == -1) {
-    if (table->deleteFailureIsError) return Fail(table, error, "Delete API Failed");
-    deleted = 0;
-  }
-  *count = deleted;
-  return TRUE;
+  const BusTable* table = nullptr;
+  const SharedTableService* service = ServiceOf(self, &table);
+  if (service == nullptr) return FALSE;
+  return Answer(table, service->Delete(where, count), error);
 }
 
 }  // namespace

@@ -31,26 +31,29 @@ void ProviderRegistry::Release() {
 
 ProviderRegistry::~ProviderRegistry() {}
 
-int ProviderRegistry::CreateProviders() {
-  useApp = new (std::nothrow) UseAppSurveyLogProvider();
-  manageApp = new (std::nothrow) ManageAppSurveyLogProvider();
-  useAppFeature = new (std::nothrow) UseAppFeatureSurveyLogProvider();
-  reportAppStatus = new (std::nothrow) ReportAppStatusSurveyLogProvider();
-  appError = new (std::nothrow) AppErrorSurveyLogProvider();
-  serverUpload = new (std::nothrow) ServerUploadLogProvider();
+void ProviderRegistry::FreeProviders() {
+  useApp.reset();
+  useAppFeature.reset();
+  reportAppStatus.reset();
+  appError.reset();
+  manageApp.reset();
+  serverUpload.reset();
+}
 
-  BaseLogProvider* const ordered[] = {useApp,   useAppFeature, reportAppStatus,
-                                      appError, manageApp,     serverUpload};
+int ProviderRegistry::CreateProviders() {
+  useApp.reset(new (std::nothrow) UseAppSurveyLogProvider());
+  manageApp.reset(new (std::nothrow) ManageAppSurveyLogProvider());
+  useAppFeature.reset(new (std::nothrow) UseAppFeatureSurveyLogProvider());
+  reportAppStatus.reset(new (std::nothrow) ReportAppStatusSurveyLogProvider());
+  appError.reset(new (std::nothrow) AppErrorSurveyLogProvider());
+  serverUpload.reset(new (std::nothrow) ServerUploadLogProvider());
+
+  BaseLogProvider* const ordered[] = {useApp.get(),   useAppFeature.get(), reportAppStatus.get(),
+                                      appError.get(), manageApp.get(),     serverUpload.get()};
   bool complete = true;
   for (BaseLogProvider* provider : ordered) complete = complete && provider != nullptr;
   if (!complete) {
-    for (BaseLogProvider* provider : ordered) delete provider;
-    useApp = nullptr;
-    useAppFeature = nullptr;
-    reportAppStatus = nullptr;
-    appError = nullptr;
-    manageApp = nullptr;
-    serverUpload = nullptr;
+    FreeProviders();
     return -1;
   }
 
@@ -73,22 +76,16 @@ BaseLogProvider* ProviderRegistry::Lookup(const char* name) {
 }
 
 void ProviderRegistry::Teardown() {
-  BaseLogProvider* const ordered[] = {useApp,   useAppFeature, reportAppStatus,
-                                      appError, manageApp,     serverUpload};
+  BaseLogProvider* const ordered[] = {useApp.get(),   useAppFeature.get(), reportAppStatus.get(),
+                                      appError.get(), manageApp.get(),     serverUpload.get()};
   DbManager* survey = DbManager::GetInstance();
   UploadDbManager* upload = UploadDbManager::GetInstance();
   for (int i = 0; i < 5; ++i)
     if (survey != nullptr) survey->RemoveListener(ordered[i]);
-  if (upload != nullptr) upload->RemoveListener(serverUpload);
+  if (upload != nullptr) upload->RemoveListener(serverUpload.get());
 
   for (const char* key : kKeys) providers.erase(key);
-  for (BaseLogProvider* provider : ordered) delete provider;
-  useApp = nullptr;
-  useAppFeature = nullptr;
-  reportAppStatus = nullptr;
-  appError = nullptr;
-  manageApp = nullptr;
-  serverUpload = nullptr;
+  FreeProviders();
   providers.clear();
 }
 

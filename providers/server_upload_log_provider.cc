@@ -10,6 +10,11 @@ namespace _CorvaneLogManager {
 
 namespace {
 
+// The queue's table description; records never expire by age (see DeleteExpiredRows).
+constexpr int32_t kRetentionDays = 3;
+constexpr int32_t kCheckInterval = 500;
+constexpr int32_t kMaxRows = 5000;
+
 DbConnection* UploadConnection() {
   UploadDbManager* manager = UploadDbManager::GetInstance();
   return manager == nullptr ? nullptr : manager->GetConnection();
@@ -24,7 +29,7 @@ ServerUploadLogProvider::ServerUploadLogProvider() {
   (void)InitTableConfig("survey_log",
                         "_id,timestamp,svc_code,category_code,activity,log_type,app_version, "
                         "body, rly_result",
-                        3, 500, 5000, 0);
+                        kRetentionDays, kCheckInterval, kMaxRows, 0);
 }
 
 int ServerUploadLogProvider::Initialize() {

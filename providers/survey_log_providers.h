@@ -27,15 +27,12 @@ class SurveyLogProvider : public BaseLogProvider {
   const char* GetCreateTableSql() override;
   const char* GetTableName() override;
 
-  // The bus object of a shared table, null for the others (or when it could not be made).
-  void* GetBusObject() const { return busObject; }
-
  protected:
   explicit SurveyLogProvider(SurveyTable table);
 
  private:
   const SurveyTableInfo& info;
-  void* busObject = nullptr;
+  void* busObject = nullptr;  // the bus object of a shared table, null for the others
 };
 
 class UseAppSurveyLogProvider final : public SurveyLogProvider {

@@ -40,6 +40,12 @@ const char kKeyLibrary[] = "/usr/lib/libsqlite3.so.0";
 // same tables at its start); the main loop's statements never wait.
 const int kSetupBusyWaitMs = 10000;  // a start may wait; a slow or loaded device needs it
 const int kBusyPollMs = 10;
+const int64_t kUsPerS = 1000000;
+const int64_t kUsPerMs = 1000;
+const int64_t kNsPerUs = 1000;
+const int64_t kNsPerMs = 1000000;
+// A database file only the daemon's user may read or write.
+const mode_t kOwnerOnly = 0600;
 const char* const kJournalPragmas[] = {"PRAGMA journal_mode=WAL;", "PRAGMA synchronous=NORMAL;"};
 // No value a daemon statement makes comes near this; a bus request cannot build more.
 const int kMaxValueLength = 1 << 20;
@@ -57,9 +63,9 @@ void EnableCancel() {
 int64_t ThreadCpuNs() {
   struct rusage usage;
   if (getrusage(RUSAGE_THREAD, &usage) != 0) return 0;
-  int64_t us = (static_cast<int64_t>(usage.ru_utime.tv_sec) + usage.ru_stime.tv_sec) * 1000000LL +
+  int64_t us = (static_cast<int64_t>(usage.ru_utime.tv_sec) + usage.ru_stime.tv_sec) * kUsPerS +
                usage.ru_utime.tv_usec + usage.ru_stime.tv_usec;
-  return us * 1000;
+  return us * kNsPerUs;
 }
 
 // Creates |path| owner-only when it does not exist yet. Not following a link, and exclusive,
@@ -67,9 +73,9 @@ int64_t ThreadCpuNs() {
 void CreateOwnerOnly(const char* path) {
   // SQLite's own names (":memory:", "", URIs) are no files to make.
   if (path[0] == '\0' || path[0] == ':' || strncmp(path, "file:", 5) == 0) return;
-  int fd = open(path, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+  int fd = open(path, O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, kOwnerOnly);
   if (fd < 0) return;
-  (void)fchmod(fd, 0600);  // the umask may have taken bits off, never added any
+  (void)fchmod(fd, kOwnerOnly);  // the umask may have taken bits off, never added any
   (void)close(fd);
 }
 
@@ -142,7 +148,7 @@ int DbConnection::OnBusy(void* self, int attempts) {
   DbConnection* conn = static_cast<DbConnection*>(self);
   if (conn->ScopeOfThisThread() != StatementScope::kSetup) return 0;
   if (attempts * kBusyPollMs >= kSetupBusyWaitMs) return 0;
-  (void)usleep(kBusyPollMs * 1000);
+  (void)usleep(kBusyPollMs * kUsPerMs);
   return 1;
 }
 
@@ -157,7 +163,7 @@ StatementScope DbConnection::ScopeOfThisThread() const {
 bool DbConnection::EnterScope(StatementScope wanted, const char* table) {
   if (scope.load(std::memory_order_acquire) != StatementScope::kDaemon) return false;
   scopeTable = table;
-  busCpuDeadlineNs = ThreadCpuNs() + static_cast<int64_t>(busBudgetMs) * 1000000LL;
+  busCpuDeadlineNs = ThreadCpuNs() + static_cast<int64_t>(busBudgetMs) * kNsPerMs;
   busBudgetSpent = false;
   resultLimit = SIZE_MAX;
   resultTooLarge = false;

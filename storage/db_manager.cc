@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <new>
 
-#include "include/base_log_provider.h"
 #include "include/db_connection.h"
 #include "platform/fixed_path.h"
+#include "storage/db_response_listener.h"
 
 namespace _CorvaneLogManager {
 
@@ -25,15 +25,15 @@ int OpenFixed(DbConnection* connection, const char* path) {
   return connection->Open(logmgr_fixed_path(path, buf, sizeof(buf)));
 }
 
-// Listeners are providers; anything else has no table to create or trim.
 void InitializeAll(const std::vector<IDbResponseListener*>& listeners) {
-  for (IDbResponseListener* listener : listeners) {
-    BaseLogProvider* provider = dynamic_cast<BaseLogProvider*>(listener);
-    if (provider != nullptr) (void)provider->Initialize();
-  }
+  for (IDbResponseListener* listener : listeners) (void)listener->Initialize();
 }
 
 }  // namespace
+
+DatabaseOwner::DatabaseOwner() = default;
+
+DatabaseOwner::~DatabaseOwner() = default;
 
 void DatabaseOwner::AddListener(IDbResponseListener* listener) { listeners.push_back(listener); }
 
@@ -51,7 +51,7 @@ DbManager* DbManager::GetInstance() {
   if (g_dbManager != nullptr) return g_dbManager;
   DbManager* manager = new (std::nothrow) DbManager();
   if (manager == nullptr) return nullptr;
-  manager->connection = new (std::nothrow) DbConnection();
+  manager->connection.reset(new (std::nothrow) DbConnection());
   // The manager is abandoned, not freed, on this out-of-memory path (deliberate).
   if (manager->connection == nullptr) return nullptr;
   g_dbManager = manager;
@@ -65,24 +65,18 @@ void DbManager::CloseInstance() {
 
 DbManager::~DbManager() {
   listeners.clear();
-  if (connection != nullptr) {
-    (void)connection->Close();
-    delete connection;
-  }
+  if (connection != nullptr) (void)connection->Close();
 }
 
 int DbManager::Init() {
   // The connection exists whenever GetInstance handed out the manager.
-  if (OpenFixed(connection, kSurveyDbPath) != 0) return -1;
+  if (OpenFixed(connection.get(), kSurveyDbPath) != 0) return -1;
   InitializeAll(listeners);
   return 0;
 }
 
 int DbManager::NotifyDeleteExpired() {
-  for (IDbResponseListener* listener : listeners) {
-    BaseLogProvider* provider = dynamic_cast<BaseLogProvider*>(listener);
-    if (provider != nullptr) (void)provider->DeleteExpiredRows();
-  }
+  for (IDbResponseListener* listener : listeners) (void)listener->DeleteExpiredRows();
   return 0;
 }
 
@@ -90,7 +84,7 @@ UploadDbManager* UploadDbManager::GetInstance() {
   if (g_uploadDbManager != nullptr) return g_uploadDbManager;
   UploadDbManager* manager = new (std::nothrow) UploadDbManager();
   if (manager == nullptr) return nullptr;
-  manager->connection = new (std::nothrow) DbConnection();
+  manager->connection.reset(new (std::nothrow) DbConnection());
   if (manager->connection == nullptr) return nullptr;  // abandoned, as above
   g_uploadDbManager = manager;
   return manager;
@@ -104,7 +98,6 @@ void UploadDbManager::CloseInstance() {
 UploadDbManager::~UploadDbManager() {
   listeners.clear();
   (void)CloseConnection();
-  delete connection;
 }
 
 int UploadDbManager::CloseConnection() {
@@ -114,7 +107,7 @@ int UploadDbManager::CloseConnection() {
 
 int UploadDbManager::Init() {
   if (connection == nullptr) return -1;
-  if (OpenFixed(connection, kUploadDbPath) != 0) return -1;
+  if (OpenFixed(connection.get(), kUploadDbPath) != 0) return -1;
   InitializeAll(listeners);
   return 0;
 }

@@ -3,6 +3,7 @@
 #ifndef LOGMGR_STORAGE_DB_MANAGER_H_
 #define LOGMGR_STORAGE_DB_MANAGER_H_
 
+#include <memory>
 #include <vector>
 
 namespace _CorvaneLogManager {
@@ -14,7 +15,7 @@ class IDbResponseListener;
 // file. Duplicates are kept; removal drops the first equal entry.
 class DatabaseOwner {
  public:
-  DbConnection* GetConnection() { return connection; }
+  DbConnection* GetConnection() { return connection.get(); }
   void AddListener(IDbResponseListener* listener);
   void RemoveListener(IDbResponseListener* listener);
   // Lets every listener create its table; kept in the interface, called by nobody.
@@ -22,10 +23,10 @@ class DatabaseOwner {
   const std::vector<IDbResponseListener*>& Listeners() const { return listeners; }
 
  protected:
-  DatabaseOwner() = default;
-  ~DatabaseOwner() = default;
+  DatabaseOwner();
+  ~DatabaseOwner();
 
-  DbConnection* connection = nullptr;
+  std::unique_ptr<DbConnection> connection;
   std::vector<IDbResponseListener*> listeners;
 };
 

@@ -4,10 +4,11 @@
 #include <openssl/evp.h>
 #include <stdio.h>
 #include <string.h>
-#include <sys/time.h>
 
+#include <memory>
 #include <new>
 
+#include "base/clock.h"
 #include "platform/fixed_path.h"
 
 namespace _CorvaneLogManager {
@@ -32,16 +33,13 @@ FILE* OpenPasswordFile(const char* mode) {
 
 KeyParams* GetKeyParams() {
   if (g_keyParams != nullptr) return g_keyParams;
-  KeyParams* params = new (std::nothrow) KeyParams;
+  std::unique_ptr<KeyParams> params(new (std::nothrow) KeyParams);
   if (params == nullptr) return nullptr;
   params->keyLength = kKeyLength;
   params->iterations = kIterations;
-  if (PreparePasswordFile(params) != 0) {
-    delete params;
-    return g_keyParams;
-  }
-  g_keyParams = params;
-  return params;
+  if (PreparePasswordFile(params.get()) != 0) return g_keyParams;
+  g_keyParams = params.release();
+  return g_keyParams;
 }
 
 void ReleaseKeyParams() {
@@ -57,27 +55,20 @@ int PreparePasswordFile(KeyParams* params) {
     (void)fclose(file);
     if (present) return 0;
   }
-  unsigned char* key = DeriveKey(params);
+  std::unique_ptr<unsigned char[]> key(DeriveKey(params));
   if (key == nullptr) return -1;
   file = OpenPasswordFile("w");
-  if (file == nullptr) {
-    delete[] key;
-    return -1;
-  }
+  if (file == nullptr) return -1;
   // Written as a text: only the bytes before the first zero byte reach the file.
-  (void)fputs(reinterpret_cast<const char*>(key), file);
+  (void)fputs(reinterpret_cast<const char*>(key.get()), file);
   (void)fclose(file);
-  delete[] key;
   return 0;
 }
 
 unsigned char* DeriveKey(KeyParams* params) {
   if (params == nullptr || params->keyLength <= 0) return nullptr;
-  struct timeval tv;
-  (void)gettimeofday(&tv, nullptr);
   char password[1024];
-  (void)snprintf(password, sizeof(password), "%lld",
-                 static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000);
+  (void)snprintf(password, sizeof(password), "%lld", static_cast<long long>(WallClockMs()));
   unsigned char* out = new (std::nothrow) unsigned char[params->keyLength + 1];
   if (out == nullptr) return nullptr;
   out[params->keyLength] = 0;

@@ -95,22 +95,24 @@ bool VerifyDeviceId(const std::string& id) {
   return memcmp(suffix, id.data() + kBodyLength, sizeof(suffix)) == 0;
 }
 
+PrefStore::PrefStore() = default;
+
+PrefStore::~PrefStore() = default;
+
 int PrefStore::Create() {
   if (connection != nullptr) return Open();
-  connection = new (std::nothrow) DbConnection();
+  connection.reset(new (std::nothrow) DbConnection());
   if (connection == nullptr) return -1;
   if (Open() == 0) return 0;
   (void)connection->Close();
-  delete connection;
-  connection = nullptr;
+  connection.reset();
   return -1;
 }
 
 int PrefStore::Close() {
   if (connection == nullptr) return -1;
   int rc = connection->Close();
-  delete connection;
-  connection = nullptr;
+  connection.reset();
   return rc;
 }
 
@@ -120,7 +122,7 @@ int PrefStore::Open() {
   if (connection->Open(logmgr_fixed_path(kDbPath, path, sizeof(path))) != 0) return -1;
   // The device id's first write belongs to the open too: a second process opening the store
   // at the same moment holds the lock briefly, and the open waits for it instead of failing.
-  DbConnection::SetupScope setup(connection);
+  DbConnection::SetupScope setup(connection.get());
   if (connection->Exec(kCreateSql) != 0) return -1;
   std::string id;
   if (GetString(kDeviceIdKey, &id) != 0) return -1;
@@ -158,15 +160,10 @@ int PrefStore::GetString(const char* key, std::string* value) {
   char sql[1024];
   (void)snprintf(sql, sizeof(sql), "SELECT %s FROM %s WHERE %s=%s;", "pref_data", kTable,
                  "pref_key", keyLiteral);
-  int count = 0;
-  char** rows = nullptr;
-  int rc = connection->Select(sql, kTable, &count, &rows);
+  QueryRows rows;
+  int rc = connection->Select(sql, kTable, &rows.count, &rows.rows);
   value->clear();
-  if (rc == 0 && count == 1) *value = rows[0];  // trailing comma kept on purpose
-  if (rc == 0 && count > 0) {
-    for (int i = 0; i < count; ++i) delete[] rows[i];
-    delete[] rows;
-  }
+  if (rc == 0 && rows.count == 1) *value = rows[0];  // trailing comma kept on purpose
   return rc;
 }
 

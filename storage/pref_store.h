@@ -6,6 +6,7 @@
 #include <stdint.h>
 #include <time.h>
 
+#include <memory>
 #include <string>
 
 namespace _CorvaneLogManager {
@@ -33,8 +34,9 @@ bool VerifyDeviceId(const std::string& id);
 
 class PrefStore {
  public:
-  PrefStore() = default;
-  ~PrefStore() = default;
+  PrefStore();
+  // Frees the connection object; closing it is Close's.
+  ~PrefStore();
 
   // Allocates the connection and opens the store. 0 / -1.
   int Create();
@@ -67,7 +69,7 @@ class PrefStore {
   uint32_t NormaliseSentDate();
 
  private:
-  DbConnection* connection = nullptr;
+  std::unique_ptr<DbConnection> connection;
 };
 
 }  // namespace _CorvaneLogManager

@@ -32,11 +32,11 @@ StatusSnapshotStore* StatusSnapshotStore::GetInstance() {
   // Registered before opening: a failed open still leaves this instance for later callers,
   // who tolerate its failing operations. Deliberate.
   g_store = store;
-  store->connection = new (std::nothrow) DbConnection();
+  store->connection.reset(new (std::nothrow) DbConnection());
   if (store->connection == nullptr) return nullptr;
   char buf[PATH_MAX];
   if (store->connection->Open(logmgr_fixed_path(kDbPath, buf, sizeof(buf))) != 0) return nullptr;
-  DbConnection::SetupScope setup(store->connection);
+  DbConnection::SetupScope setup(store->connection.get());
   if (store->connection->Exec(kCreateSql) != 0) return nullptr;
   return store;
 }
@@ -47,10 +47,7 @@ void StatusSnapshotStore::DestroyInstance() {
 }
 
 StatusSnapshotStore::~StatusSnapshotStore() {
-  if (connection != nullptr) {
-    (void)connection->Close();
-    delete connection;
-  }
+  if (connection != nullptr) (void)connection->Close();
 }
 
 int StatusSnapshotStore::Put(const char* feature, const char* extra, int64_t timestamp) {
@@ -76,10 +73,9 @@ int StatusSnapshotStore::Get(const char* feature, std::string* extraOut, int64_t
   (void)snprintf(sql, sizeof(sql),
                  "SELECT extra,timestamp FROM survey_status_monitor WHERE feature = %s;",
                  featureLiteral);
-  int rowCount = 0;
-  char** rows = nullptr;
-  if (connection->Select(sql, kTable, &rowCount, &rows) != 0) return -1;
-  if (rowCount <= 0) {
+  QueryRows rows;
+  if (connection->Select(sql, kTable, &rows.count, &rows.rows) != 0) return -1;
+  if (rows.count <= 0) {
     *extraOut = "";
     *timestampOut = 0;
     return 0;
@@ -94,8 +90,6 @@ int StatusSnapshotStore::Get(const char* feature, std::string* extraOut, int64_t
     extraOut->assign(row, comma - row);
     *timestampOut = strtoll(comma + 1, nullptr, 10);
   }
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
   return 0;
 }
 

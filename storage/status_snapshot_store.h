@@ -5,6 +5,7 @@
 
 #include <stdint.h>
 
+#include <memory>
 #include <string>
 
 namespace _CorvaneLogManager {
@@ -29,7 +30,7 @@ class StatusSnapshotStore {
   StatusSnapshotStore() = default;
   ~StatusSnapshotStore();
 
-  DbConnection* connection = nullptr;
+  std::unique_ptr<DbConnection> connection;
 };
 
 }  // namespace _CorvaneLogManager

@@ -16,6 +16,7 @@
 #include "platform/host/vconf_store.h"
 #include "providers/provider_bus_guard.h"
 #include "providers/statement_buffer.h"
+#include "providers/statement_builder.h"
 #include "reporting/row_splitter.h"
 
 namespace fuzz_checks {
@@ -240,21 +241,25 @@ inline std::string CheckBusGuard(const uint8_t* data, size_t size) {
     return "lists differ from the accepted entries";
 
   using namespace _CorvaneLogManager;
-  std::string failed =
-      Agree("insert", InsertFits(table, lists, autoTexts), BuildInsert(table, lists, autoTexts));
+  std::string failed = Agree(
+      "insert",
+      InsertStatementFits(table, lists.columns, lists.values, autoTexts.columns, autoTexts.values),
+      BuildInsert(table, lists, autoTexts));
   // Wheres: none, the caller's text, and the upsert's (app_id, feature) condition.
   std::vector<const char*> wheres = {nullptr, parts[2].c_str()};
   std::string condition = "app_id='" + appId + "' and feature='" + feature + "'";
   wheres.push_back(condition.c_str());
   for (const char* where : wheres) {
     if (failed.empty())
-      failed = Agree("update", UpdateFits(table, lists, autoTexts, where),
+      failed = Agree("update",
+                     UpdateStatementFits(table, lists.columns, lists.values, autoTexts.columns,
+                                         autoTexts.values, where, ","),
                      BuildUpdate(table, lists, autoTexts, where));
     if (failed.empty())
-      failed = Agree("select", SelectFits(table, parts[1].c_str(), where),
+      failed = Agree("select", SelectStatementFits(table, parts[1].c_str(), where),
                      BuildSelect(table, parts[1], where));
     if (failed.empty() && where != nullptr)
-      failed = Agree("delete", DeleteFits(table, where),
+      failed = Agree("delete", DeleteStatementFits(table, where),
                      Whole("DELETE FROM " + table + " WHERE " + where + ";"));
   }
   return failed;

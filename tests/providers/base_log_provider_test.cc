@@ -33,10 +33,10 @@ TEST_F(BaseLogProviderTest, InsertAppendsTimestampAndZoneOrLeavesZoneNull) {
   for (const auto& c : cases) {
     SCOPED_TRACE(c.link);
     SetLocaltimeLink(c.link);
-    long long before = TestNowMs();
+    long long before = WallClockMs();
     int32_t rowId = 0;
     ASSERT_EQ(useApp->InsertRow("app_id,duration", "'com.example',12", &rowId), 0);
-    long long after = TestNowMs();
+    long long after = WallClockMs();
     std::vector<std::string> run = Taken("INSERT");
     ASSERT_EQ(run.size(), 1u);
     std::string zone;
@@ -99,20 +99,16 @@ TEST_F(BaseLogProviderTest, UpdateQuotesBareValuesAndRefreshesAutoColumns) {
 TEST_F(BaseLogProviderTest, SelectPlacesGroupByBeforeOrderBy) {
   Fill(survey, "use_app_survey", "app_id,duration", "'a',1", 2);
   Fill(survey, "use_app_survey", "app_id,duration", "'b',4", 1);
-  int rowCount = -1;
-  char** rows = nullptr;
+  QueryRows rows;
   ASSERT_EQ(useApp->SelectGroupedRows("app_id,SUM(duration)", "duration > 0", "app_id DESC",
-                                      "app_id", &rowCount, &rows),
+                                      "app_id", &rows.count, &rows.rows),
             0);
-  ASSERT_EQ(rowCount, 2);
+  ASSERT_EQ(rows.count, 2);
   EXPECT_STREQ(rows[0], "b,4,");
   EXPECT_STREQ(rows[1], "a,2,");
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
-  ASSERT_EQ(useApp->SelectRows(nullptr, nullptr, nullptr, &rowCount, &rows), 0);
-  for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-  delete[] rows;
-  EXPECT_EQ(rowCount, 3);
+  rows.Reset();
+  ASSERT_EQ(useApp->SelectRows(nullptr, nullptr, nullptr, &rows.count, &rows.rows), 0);
+  EXPECT_EQ(rows.count, 3);
   EXPECT_EQ(Taken("SELECT"),
             (std::vector<std::string>{"SELECT app_id,SUM(duration) FROM use_app_survey WHERE "
                                       "duration > 0 GROUP BY app_id ORDER BY app_id DESC;",
@@ -146,7 +142,7 @@ TEST_F(BaseLogProviderTest, ExpiryKeepsStatusTenDaysAndTheRestThree) {
   const long long day = 86400000LL, hour = 3600000LL;
   const char* tables[] = {"use_app_survey", "manage_app_survey", "report_app_error_survey",
                           "use_app_feature_survey", "report_app_status_survey"};
-  long long now = TestNowMs();
+  long long now = WallClockMs();
   for (const char* table : tables)
     for (long long age : {3 * day - hour, 3 * day + hour, 10 * day - hour, 10 * day + hour})
       Fill(survey, table, "timestamp", std::to_string(now - age), 1);

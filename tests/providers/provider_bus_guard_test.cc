@@ -4,16 +4,12 @@
 #include "providers/provider_bus_guard.h"
 
 #include <gtest/gtest.h>
-#include <sqlite3.h>
 #include <stdlib.h>
 #include <sys/ipc.h>
 #include <sys/shm.h>
 #include <unistd.h>
 
-#include "include/base_log_provider.h"
-#include "include/db_connection.h"
-#include "include/provider_registry.h"
-#include "storage/db_manager.h"
+#include "providers/local_zone.h"
 #include "tests/providers/provider_test_env.h"
 
 namespace _CorvaneLogManager {
@@ -62,58 +58,23 @@ TEST(ProviderBusGuardTest, RowEntriesAcceptOnlyWritableColumnsAndQuotelessValues
   }
 }
 
-// The real registry and survey database in a temp sysroot, with a trace of the statements.
-class ProviderBusFitTest : public ::testing::Test {
+// The real registry and survey database, asked by the guard's own row lists.
+class ProviderBusFitTest : public ProviderTest {
  protected:
   void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-busguard-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    ASSERT_EQ(system(("mkdir -p " + sysroot + "/opt/usr/dbspace " + sysroot + "/opt/etc").c_str()),
-              0);
-    ASSERT_EQ(
-        symlink("/usr/share/zoneinfo/Europe/Berlin", (sysroot + "/opt/etc/localtime").c_str()), 0);
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
-    ASSERT_NE(DbManager::GetInstance(), nullptr);
-    ASSERT_NE(UploadDbManager::GetInstance(), nullptr);
-    ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
-    ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
-    survey = DbManager::GetInstance()->GetConnection()->Handle();
-    sqlite3_trace_v2(survey, SQLITE_TRACE_STMT, &ProviderBusFitTest::OnStatement, this);
+    ProviderTest::SetUp();
+    StartProviders();
   }
-  void TearDown() override {
-    if (survey != nullptr) sqlite3_trace_v2(survey, 0, nullptr, nullptr);
-    ProviderRegistry::Release();
-    DbManager::CloseInstance();
-    UploadDbManager::CloseInstance();
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf " + sysroot).c_str());
-  }
-  static int OnStatement(unsigned, void* self, void* stmt, void*) {
-    static_cast<ProviderBusFitTest*>(self)->statements.push_back(ExpandedText(stmt));
-    return 0;
-  }
-
-  BaseLogProvider* Feature() {
-    return ProviderRegistry::GetInstance()->Lookup("use_app_feature_survey");
-  }
+  BaseLogProvider* Feature() { return Provider("use_app_feature_survey"); }
   // The last traced statement beginning with |verb| (an insert may be followed by a count).
   std::string LastStatement(const std::string& verb) {
     std::string last;
-    for (const std::string& sql : statements)
+    for (const std::string& sql : surveyTrace.Take())
       if (sql.compare(0, verb.size(), verb) == 0) last = sql;
-    statements.clear();
     return last;
   }
   long long StoredExtraLength() {
-    sqlite3_stmt* stmt = nullptr;
-    long long length = -1;
-    if (sqlite3_prepare_v2(survey, "SELECT length(extra) FROM use_app_feature_survey;", -1, &stmt,
-                           nullptr) == SQLITE_OK &&
-        sqlite3_step(stmt) == SQLITE_ROW)
-      length = sqlite3_column_int64(stmt, 0);
-    sqlite3_finalize(stmt);
-    return length;
+    return Number(survey, "SELECT length(extra) FROM use_app_feature_survey;");
   }
   BusRowLists Lists(size_t extraLength) {
     BusRowLists lists;
@@ -121,20 +82,25 @@ class ProviderBusFitTest : public ::testing::Test {
     EXPECT_EQ(AppendRowEntry(kColumns, "extra", std::string(extraLength, 'e').c_str(), &lists), 0);
     return lists;
   }
-
-  std::string sysroot;
-  sqlite3* survey = nullptr;
-  std::vector<std::string> statements;
 };
 
 // At the largest accepted size each statement is exactly 1023 bytes and runs whole; one byte
 // more is refused.
 TEST_F(ProviderBusFitTest, LargestAcceptedStatementsRunWholeAndOneMoreIsRefused) {
-  const std::string table = "use_app_feature_survey";
-  BusRowLists autoTexts = AutoColumnTexts(Feature()->Config().columns);
+  BaseLogProvider* feature = Feature();
+  auto insertFits = [&](const BusRowLists& lists) {
+    return feature->InsertFits(lists.columns.c_str(), lists.values.c_str());
+  };
+  auto updateFits = [&](const BusRowLists& lists, const std::string& where) {
+    return feature->UpdateFits(lists.columns.c_str(), lists.values.c_str(), where.c_str());
+  };
+  // ",<13-digit ms>,<zone literal>", as the provider appends them.
+  std::string zone;
+  ASSERT_TRUE(LocalZoneLiteral(&zone));
+  const size_t autoValues = 1 + 13 + 1 + zone.size();
 
   size_t extra = 0;
-  while (InsertFits(table, Lists(extra + 1), autoTexts)) ++extra;
+  while (insertFits(Lists(extra + 1))) ++extra;
   ASSERT_GT(extra, 900u);
   ASSERT_EQ(Feature()->InsertRow(Lists(extra).columns.c_str(), Lists(extra).values.c_str()), 0);
   EXPECT_EQ(LastStatement("INSERT").size(), 1023u);
@@ -142,28 +108,26 @@ TEST_F(ProviderBusFitTest, LargestAcceptedStatementsRunWholeAndOneMoreIsRefused)
 
   // Update: the lists (with timestamp and time_zone) stay below 200 bytes.
   size_t value = 0;
-  while (UpdateFits(table, Lists(value + 1), autoTexts, "1")) ++value;
-  EXPECT_EQ(Lists(value).values.size() + autoTexts.values.size(), 199u);
+  while (updateFits(Lists(value + 1), "1")) ++value;
+  EXPECT_EQ(Lists(value).values.size() + autoValues, 199u);
   ASSERT_EQ(Feature()->UpdateRows(Lists(value).columns.c_str(), Lists(value).values.c_str(), "1"),
             0);
   EXPECT_EQ(StoredExtraLength(), static_cast<long long>(value));
   // ... and the where fills the statement up to its last byte.
   std::string where = "1";
-  while (UpdateFits(table, Lists(10), autoTexts, (where + " ").c_str())) where += " ";
+  while (updateFits(Lists(10), where + " ")) where += " ";
   ASSERT_EQ(
       Feature()->UpdateRows(Lists(10).columns.c_str(), Lists(10).values.c_str(), where.c_str()), 0);
   EXPECT_EQ(LastStatement("UPDATE").size(), 1023u);
 
   std::string columns = "app_id";
-  while (SelectFits(table, (columns + " ").c_str(), nullptr)) columns += " ";
-  int rowCount = 0;
-  char** rows = nullptr;
-  ASSERT_EQ(Feature()->SelectRows(columns.c_str(), nullptr, nullptr, &rowCount, &rows), 0);
-  FreeRows(rows, rowCount);
+  while (feature->SelectFits((columns + " ").c_str(), nullptr)) columns += " ";
+  QueryRows rows;
+  ASSERT_EQ(Feature()->SelectRows(columns.c_str(), nullptr, nullptr, &rows.count, &rows.rows), 0);
   EXPECT_EQ(LastStatement("SELECT").size(), 1023u);
 
   where = "0";
-  while (DeleteFits(table, (where + " ").c_str())) where += " ";
+  while (feature->DeleteFits((where + " ").c_str())) where += " ";
   ASSERT_EQ(Feature()->DeleteRows(where.c_str()), 0);
   EXPECT_EQ(LastStatement("DELETE").size(), 1023u);
 }
@@ -218,12 +182,23 @@ TEST(ProviderBusGuardTest, ABusRequestScopeConfinesStatementsToTheOwnTableWhileA
   (void)system(("rm -rf " + dir).c_str());
 }
 
+// The first |count| rows of "x,1," and "y,2,", owned as a select hands them out.
+void TwoRowResult(int count, QueryRows* rows) {
+  rows->Reset();
+  if (count == 0) return;
+  rows->rows = new char*[count];
+  for (int i = 0; i < count; ++i) {
+    rows->rows[i] = new char[5];
+    memcpy(rows->rows[i], i == 0 ? "x,1," : "y,2,", 5);
+  }
+  rows->count = count;
+}
+
 TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetached) {
-  char first[] = "x,1,";
-  char second[] = "y,2,";
-  char* rows[] = {first, second};
+  QueryRows rows;
+  TwoRowResult(2, &rows);
   const char kResult[] = "x,1,\0y,2,\0&";
-  ASSERT_EQ(SegmentBytes(rows, 2), sizeof(kResult) - 1);
+  ASSERT_EQ(SegmentBytes(rows), sizeof(kResult) - 1);
   struct Case {
     size_t size;
     uid_t owner;
@@ -238,7 +213,9 @@ TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetach
     SCOPED_TRACE("size " + std::to_string(c.size) + " rows " + std::to_string(c.rowCount));
     int id = shmget(IPC_PRIVATE, c.size, IPC_CREAT | 0600);
     ASSERT_NE(id, -1);
-    EXPECT_EQ(WriteRowsToSegment(id, c.owner, rows, c.rowCount), c.result);
+    QueryRows result;
+    TwoRowResult(c.rowCount, &result);
+    EXPECT_EQ(WriteRowsToSegment(id, c.owner, result), c.result);
     struct shmid_ds info;
     ASSERT_EQ(shmctl(id, IPC_STAT, &info), 0);
     EXPECT_EQ(info.shm_nattch, 0u);
@@ -251,13 +228,13 @@ TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetach
     shmdt(base);
     shmctl(id, IPC_RMID, nullptr);
   }
-  EXPECT_EQ(WriteRowsToSegment(-1, getuid(), rows, 2), -1);
+  EXPECT_EQ(WriteRowsToSegment(-1, getuid(), rows), -1);
 
   // A segment whose owner may not write it is refused, whoever could still attach it.
   int readOnly = shmget(IPC_PRIVATE, 64, IPC_CREAT | 0400);
   ASSERT_NE(readOnly, -1);
   EXPECT_EQ(SegmentRoom(readOnly, getuid()), 0u);
-  EXPECT_EQ(WriteRowsToSegment(readOnly, getuid(), rows, 2), -1);
+  EXPECT_EQ(WriteRowsToSegment(readOnly, getuid(), rows), -1);
   shmctl(readOnly, IPC_RMID, nullptr);
 
   // A hugetlb segment without reserve has no page to give where the pool is empty: writing it
@@ -266,7 +243,7 @@ TEST(ProviderBusGuardTest, SegmentIsWrittenOnlyWhenOwnedAndLargeEnoughThenDetach
   int huge = shmget(IPC_PRIVATE, 2 << 20, IPC_CREAT | 0600 | SHM_HUGETLB | SHM_NORESERVE);
   if (huge == -1) GTEST_SKIP() << "no hugetlb segments here";
   EXPECT_EQ(SegmentRoom(huge, getuid()), size_t{2} << 20);
-  int result = WriteRowsToSegment(huge, getuid(), rows, 2);
+  int result = WriteRowsToSegment(huge, getuid(), rows);
   FILE* pool = fopen("/proc/sys/vm/nr_hugepages", "r");
   long pages = -1;
   if (pool != nullptr) {

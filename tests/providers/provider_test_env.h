@@ -6,24 +6,18 @@
 #include <gtest/gtest.h>
 #include <sqlite3.h>
 #include <stdlib.h>
-#include <sys/time.h>
 #include <unistd.h>
 
 #include <string>
 #include <vector>
 
+#include "base/clock.h"
 #include "include/base_log_provider.h"
 #include "include/db_connection.h"
 #include "include/provider_registry.h"
 #include "storage/db_manager.h"
 
 namespace _CorvaneLogManager {
-
-inline long long TestNowMs() {
-  struct timeval tv;
-  gettimeofday(&tv, nullptr);
-  return static_cast<long long>(tv.tv_sec) * 1000 + tv.tv_usec / 1000;
-}
 
 // True if |text| is |pattern| with each '#' standing for a run of digits, collected in
 // |numbers| (std::regex warns in the sanitizer build).

@@ -65,21 +65,20 @@ TEST_F(ServerUploadLogProviderTest, LimitedSelectAppendsLimitWithoutBlank) {
       {nullptr, ServerUploadLogProvider::kNoLimit,
        "SELECT * FROM survey_log ORDER BY CASE activity WHEN 'x' THEN 0 END ;", 3},
   };
-  int rowCount = -1;
-  char** rows = nullptr;
   for (const auto& c : cases) {
     SCOPED_TRACE(c.statement);
-    ASSERT_EQ(queue->SelectLimitedRows(nullptr, c.where, order, c.limit, &rowCount, &rows), 0);
-    for (int i = 0; i < rowCount; ++i) delete[] rows[i];
-    delete[] rows;
-    EXPECT_EQ(rowCount, c.rows);
+    QueryRows rows;
+    ASSERT_EQ(queue->SelectLimitedRows(nullptr, c.where, order, c.limit, &rows.count, &rows.rows),
+              0);
+    EXPECT_EQ(rows.count, c.rows);
     EXPECT_EQ(uploadTrace.Take().back(), c.statement);
   }
   // Kept on purpose: a limit without a blank-terminated ORDER BY is invalid SQL, and the
   // inherited select looks in the survey database, which has no survey_log.
-  EXPECT_EQ(queue->SelectLimitedRows("_id", "1=1", nullptr, 5, &rowCount, &rows), -1);
-  EXPECT_EQ(queue->SelectRows(nullptr, nullptr, nullptr, &rowCount, &rows), 0);
-  EXPECT_EQ(rowCount, 0);
+  QueryRows rows;
+  EXPECT_EQ(queue->SelectLimitedRows("_id", "1=1", nullptr, 5, &rows.count, &rows.rows), -1);
+  EXPECT_EQ(queue->SelectRows(nullptr, nullptr, nullptr, &rows.count, &rows.rows), 0);
+  EXPECT_EQ(rows.count, 0);
 }
 
 }  // namespace

@@ -292,13 +292,11 @@ struct Worker {
 
   static void* Run(void* arg) {
     Worker* self = static_cast<Worker*>(arg);
-    int count = 0;
-    char** rows = nullptr;
+    QueryRows rows;
     if (!self->useSelect) {
       (void)self->conn->Exec(self->sql);
-    } else if (self->conn->Select(self->sql, "t", &count, &rows) == 0 && count > 0) {
-      for (int i = 0; i < count; ++i) delete[] rows[i];
-      delete[] rows;
+    } else {
+      (void)self->conn->Select(self->sql, "t", &rows.count, &rows.rows);
     }
     self->returned = true;
     return nullptr;
