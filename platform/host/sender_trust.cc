@@ -11,11 +11,11 @@ constexpr size_t kProcessCacheSize = 64;
 
 const uid_t kTrustedUids[] = {LOGMGR_SIGNAL_SENDER_UIDS};
 
-bool BusUidOf(void* context, const char* unique_name, uid_t* uid) {
+bool BusUidOf(void* context, const char* uniqueName, uid_t* uid) {
   DBusError err;
   dbus_error_init(&err);
   unsigned long owner =
-      dbus_bus_get_unix_user(static_cast<DBusConnection*>(context), unique_name, &err);
+      dbus_bus_get_unix_user(static_cast<DBusConnection*>(context), uniqueName, &err);
   if (dbus_error_is_set(&err)) {
     dbus_error_free(&err);
     return false;
@@ -38,18 +38,18 @@ bool SenderTrust::TrustedUid(uid_t uid) {
 bool SenderTrust::IsTrusted(const char* sender, UidLookup lookup, void* context) {
   // Only a unique name identifies a connection; a message without one came from no bus peer.
   if (sender == nullptr || sender[0] != ':' || lookup == nullptr) return false;
-  auto it = verdicts_.find(sender);
-  if (it != verdicts_.end()) return it->second;
+  auto it = verdicts.find(sender);
+  if (it != verdicts.end()) return it->second;
   uid_t uid = 0;
   if (!lookup(context, sender, &uid)) return false;
   bool trusted = TrustedUid(uid);
-  if (capacity_ == 0) return trusted;
-  if (order_.size() >= capacity_) {
-    verdicts_.erase(order_.front());
-    order_.pop_front();
+  if (capacity == 0) return trusted;
+  if (order.size() >= capacity) {
+    verdicts.erase(order.front());
+    order.pop_front();
   }
-  order_.emplace_back(sender);
-  verdicts_.emplace(sender, trusted);
+  order.emplace_back(sender);
+  verdicts.emplace(sender, trusted);
   return trusted;
 }
 

@@ -16,10 +16,10 @@ namespace logmgr_host {
 
 class SenderTrust {
  public:
-  // Fills |uid| with the owner of |unique_name|; false when the bus cannot tell (gone, error).
-  using UidLookup = bool (*)(void* context, const char* unique_name, uid_t* uid);
+  // Fills |uid| with the owner of |uniqueName|; false when the bus cannot tell (gone, error).
+  using UidLookup = bool (*)(void* context, const char* uniqueName, uid_t* uid);
 
-  explicit SenderTrust(size_t capacity) : capacity_(capacity) {}
+  explicit SenderTrust(size_t capacity) : capacity(capacity) {}
 
   // Whether |sender| runs as a trusted uid. Only answers the bus gave are kept: a sender that
   // already left cannot send again, and a passing bus error must not stick to a live name.
@@ -28,9 +28,9 @@ class SenderTrust {
   static bool TrustedUid(uid_t uid);
 
  private:
-  size_t capacity_;
-  std::unordered_map<std::string, bool> verdicts_;
-  std::deque<std::string> order_;  // oldest first, for eviction
+  size_t capacity;
+  std::unordered_map<std::string, bool> verdicts;
+  std::deque<std::string> order;  // oldest first, for eviction
 };
 
 // The check the listeners run on a received signal, with one cache for the process. It asks
