@@ -16,6 +16,7 @@
 
 #include "bench/ratio_reporter.h"
 #include "include/db_connection.h"
+#include "tests/temp_sysroot.h"
 
 using namespace _CorvaneLogManager;
 
@@ -24,17 +25,13 @@ namespace {
 constexpr int kRows = 5000;
 const char kSelect[] = "SELECT app_id, duration, ratio, timestamp FROM t;";
 
-std::string g_dir;
+TempSysroot* g_dir = nullptr;
 
-std::string DbFile(const char* name) { return g_dir + "/" + name; }
+std::string DbFile(const char* name) { return g_dir->Path(std::string("/") + name); }
 
-void Setup() {
-  char tmpl[] = "/tmp/logmgr-storage-bench-XXXXXX";
-  if (mkdtemp(tmpl) == nullptr) abort();
-  g_dir = tmpl;
-}
+void Setup() { g_dir = new TempSysroot("storage-bench"); }
 
-void Teardown() { (void)system(("rm -rf '" + g_dir + "'").c_str()); }
+void Teardown() { delete g_dir; }
 
 // A survey-like table of |rows| rows: a text, two numbers and a timestamp per row.
 void Fill(DbConnection* conn, int rows) {

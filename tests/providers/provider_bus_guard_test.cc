@@ -133,11 +133,9 @@ TEST_F(ProviderBusFitTest, LargestAcceptedStatementsRunWholeAndOneMoreIsRefused)
 }
 
 TEST(ProviderBusGuardTest, ABusRequestScopeConfinesStatementsToTheOwnTableWhileAlive) {
-  char tmpl[] = "/tmp/logmgr-busscope-XXXXXX";
-  ASSERT_NE(mkdtemp(tmpl), nullptr);
-  std::string dir = tmpl;
+  TempSysroot tmp("busscope");
   DbConnection conn;
-  ASSERT_EQ(conn.Open((dir + "/t.db").c_str()), 0);
+  ASSERT_EQ(conn.Open(tmp.Path("/t.db").c_str()), 0);
   {
     DbConnection::SetupScope setup(&conn);
     ASSERT_EQ(conn.Exec("CREATE TABLE own(a);"), 0);
@@ -179,7 +177,6 @@ TEST(ProviderBusGuardTest, ABusRequestScopeConfinesStatementsToTheOwnTableWhileA
   EXPECT_EQ(conn.Exec("INSERT INTO other(b) SELECT a FROM own;"), 0);
   EXPECT_EQ(conn.Count("other"), 1);
   EXPECT_EQ(conn.Close(), 0);
-  (void)system(("rm -rf " + dir).c_str());
 }
 
 // The first |count| rows of "x,1," and "y,2,", owned as a select hands them out.

@@ -10,6 +10,7 @@
 #include <time.h>
 
 #include <fstream>
+#include <memory>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -19,6 +20,7 @@
 #include "reporting/report_context.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 
@@ -33,16 +35,11 @@ class ReportingTest : public ::testing::Test {
     tzset();
     // No telephony service: the operator codes stay unknown unless a test brings a bus.
     setenv("DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/nonexistent/bus", 1);
-    char tmpl[] = "/tmp/logmgr-reporting-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    ASSERT_EQ(system(("mkdir -p " + sysroot + "/opt/usr/dbspace " + sysroot + "/etc " + sysroot +
-                      "/sys/class/dmi/id")
-                         .c_str()),
-              0);
-    WriteFile("/etc/os-release", "NAME=\"Test OS\"\nVERSION_ID=\"12\"\nBUILD_ID=W2.3-K9\n");
-    WriteFile("/sys/class/dmi/id/product_name", "Gear-X1\n");
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
+    root.reset(new TempSysroot("reporting", {"/opt/usr/dbspace"}));
+    sysroot = root->path();
+    ASSERT_TRUE(
+        root->Write("/etc/os-release", "NAME=\"Test OS\"\nVERSION_ID=\"12\"\nBUILD_ID=W2.3-K9\n"));
+    ASSERT_TRUE(root->Write("/sys/class/dmi/id/product_name", "Gear-X1\n"));
 
     ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
     ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
@@ -57,8 +54,7 @@ class ReportingTest : public ::testing::Test {
     ProviderRegistry::Release();
     DbManager::CloseInstance();
     UploadDbManager::CloseInstance();
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf " + sysroot).c_str());
+    root.reset();
   }
 
   // What the daemon hands the report run, with the test clock.
@@ -75,7 +71,7 @@ class ReportingTest : public ::testing::Test {
   }
 
   void WriteFile(const std::string& fixedPath, const std::string& text) {
-    std::ofstream(sysroot + fixedPath, std::ios::binary) << text;
+    ASSERT_TRUE(root->Write(fixedPath, text)) << fixedPath;
   }
   std::string ReadFile(const std::string& fixedPath) {
     std::ifstream in(sysroot + fixedPath, std::ios::binary);
@@ -123,6 +119,7 @@ class ReportingTest : public ::testing::Test {
     return out;
   }
 
+  std::unique_ptr<TempSysroot> root;
   std::string sysroot;
   DbConnection* survey = nullptr;
   DbConnection* upload = nullptr;

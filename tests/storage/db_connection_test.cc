@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "storage/key_derivation.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -23,18 +24,8 @@ using Rows = std::vector<std::string>;
 
 class DbConnectionTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-dbconn-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    dir = tmpl;
-    path = dir + "/test.db";
-    ASSERT_EQ(conn.Open(path.c_str()), 0);
-  }
-  void TearDown() override {
-    (void)conn.Close();
-    (void)chmod(dir.c_str(), 0700);
-    (void)system(("rm -rf '" + dir + "'").c_str());
-  }
+  void SetUp() override { ASSERT_EQ(conn.Open(path.c_str()), 0); }
+  void TearDown() override { (void)conn.Close(); }
   // Runs each statement in the open phase, the only time tables may be made.
   void Setup(std::initializer_list<const char*> statements) {
     DbConnection::SetupScope setup(&conn);
@@ -58,8 +49,9 @@ class DbConnectionTest : public ::testing::Test {
     if (count > 0) delete[] rows;
     return out;
   }
-  std::string dir;
-  std::string path;
+  TempSysroot tmp{"dbconn"};
+  const std::string dir = tmp.path();
+  const std::string path = dir + "/test.db";
   DbConnection conn;
 };
 
@@ -646,13 +638,9 @@ TEST_F(DbConnectionTest, NewFilesAreOwnerOnlyWhateverTheUmask) {
 }
 
 TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
-  char tmpl[] = "/tmp/logmgr-keyed-XXXXXX";
-  ASSERT_NE(mkdtemp(tmpl), nullptr);
-  std::string root = tmpl;
-  std::string db = root + "/opt/usr/dbspace/keyed.db";
-  std::string lib = root + "/usr/lib/libsqlite3.so.0";
-  ASSERT_EQ(system(("mkdir -p '" + root + "/opt/usr/dbspace' '" + root + "/usr/lib'").c_str()), 0);
-  setenv("LOGMGR_SYSROOT", root.c_str(), 1);
+  TempSysroot root("keyed", {"/opt/usr/dbspace", "/usr/lib"});
+  std::string db = root.Path("/opt/usr/dbspace/keyed.db");
+  std::string lib = root.Path("/usr/lib/libsqlite3.so.0");
   SetDbEncryption(true);
   DbConnection conn;
   // No key library under the sysroot: the password file is made and the open goes on unkeyed.
@@ -670,13 +658,11 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   EXPECT_EQ(conn.Handle(), nullptr);
   // An empty key: the open fails, and the file stays as it was.
   ASSERT_EQ(unlink(lib.c_str()), 0);
-  ASSERT_EQ(truncate((root + "/opt/usr/dbspace/.SecurePassword.txt").c_str(), 0), 0);
+  ASSERT_EQ(truncate(root.Path("/opt/usr/dbspace/.SecurePassword.txt").c_str(), 0), 0);
   EXPECT_EQ(conn.Open(db.c_str()), -1);
   EXPECT_EQ(ReadKey(), "");
   SetDbEncryption(false);
   ReleaseKeyParams();
-  unsetenv("LOGMGR_SYSROOT");
-  (void)system(("rm -rf '" + root + "'").c_str());
 }
 
 }  // namespace
