@@ -18,6 +18,8 @@
 #include <chrono>
 #include <string>
 
+#include "tests/temp_sysroot.h"
+
 namespace {
 
 const int kBatch = 32;
@@ -107,13 +109,10 @@ BENCHMARK(BM_ActivationVsReadlink)
 }  // namespace
 
 int main(int argc, char** argv) {
-  char tmpl[] = "/tmp/logmgr-bench-apps-XXXXXX";
-  if (mkdtemp(tmpl) == nullptr) return 1;
-  g_sysroot = tmpl;
-  if (system(("mkdir -p '" + g_sysroot + "/opt/dbspace'").c_str()) != 0) return 1;
-  setenv("LOGMGR_SYSROOT", g_sysroot.c_str(), 1);
+  TempSysroot root("bench-apps", {"/opt/dbspace"});
+  g_sysroot = root.path();
   benchmark::Initialize(&argc, argv);
   benchmark::RunSpecifiedBenchmarks();
   benchmark::Shutdown();
-  return system(("rm -rf '" + g_sysroot + "'").c_str()) == 0 ? 0 : 1;
+  return 0;
 }

@@ -23,6 +23,8 @@
 #include <string>
 #include <vector>
 
+#include "tests/temp_sysroot.h"
+
 namespace {
 
 constexpr int kRounds = 2000;
@@ -172,9 +174,8 @@ int main() {
   const char* sourceEnv = getenv("LOGMGR_SOURCE_DIR");
   std::string source = sourceEnv != nullptr ? sourceEnv : bin + "/../..";
 
-  char tmpl[] = "/tmp/logmgr-busbench-XXXXXX";
-  if (mkdtemp(tmpl) == nullptr) return 1;
-  std::string sysroot = tmpl;
+  TempSysroot root("busbench");
+  const std::string& sysroot = root.path();
   std::string exports = Run(source + "/scripts/host-env start " + sysroot + " --no-x");
   for (size_t pos = 0; (pos = exports.find("export ", pos)) != std::string::npos;) {
     size_t eq = exports.find('=', pos);
@@ -350,6 +351,5 @@ int main() {
   kill(daemon, SIGTERM);
   (void)waitpid(daemon, nullptr, 0);
   (void)Run(source + "/scripts/host-env stop " + sysroot);
-  (void)system(("rm -rf " + sysroot).c_str());
   return status;
 }

@@ -18,6 +18,7 @@
 #include "include/db_connection.h"
 #include "include/provider_registry.h"
 #include "storage/db_manager.h"
+#include "tests/temp_sysroot.h"
 
 using namespace _CorvaneLogManager;
 
@@ -26,19 +27,13 @@ namespace {
 constexpr int kLimit = 5000;
 constexpr int kBatch = 500;
 
-std::string g_sysroot;
+TempSysroot* g_sysroot = nullptr;
 BaseLogProvider* g_provider = nullptr;
 DbConnection* g_conn = nullptr;
 
 void Setup() {
-  char tmpl[] = "/tmp/logmgr-bench-XXXXXX";
-  if (mkdtemp(tmpl) == nullptr) abort();
-  g_sysroot = tmpl;
-  if (system(("mkdir -p " + g_sysroot + "/opt/usr/dbspace " + g_sysroot + "/opt/etc").c_str()) != 0)
-    abort();
-  if (symlink("/usr/share/zoneinfo/Europe/Berlin", (g_sysroot + "/opt/etc/localtime").c_str()))
-    abort();
-  setenv("LOGMGR_SYSROOT", g_sysroot.c_str(), 1);
+  g_sysroot = new TempSysroot("bench", {"/opt/usr/dbspace"});
+  if (!g_sysroot->SetLocaltime("/usr/share/zoneinfo/Europe/Berlin")) abort();
   if (DbManager::GetInstance() == nullptr || UploadDbManager::GetInstance() == nullptr ||
       ProviderRegistry::GetInstance()->CreateProviders() != 0 ||
       DbManager::GetInstance()->Init() != 0 || UploadDbManager::GetInstance()->Init() != 0)
@@ -51,7 +46,7 @@ void Teardown() {
   ProviderRegistry::Release();
   DbManager::CloseInstance();
   UploadDbManager::CloseInstance();
-  (void)system(("rm -rf " + g_sysroot).c_str());
+  delete g_sysroot;
 }
 
 // Brings the table to |rows| rows and the provider's counter to what a restart would seed.
@@ -62,6 +57,37 @@ void Prefill(int rows) {
     g_conn->Exec("INSERT INTO use_app_survey(app_id,duration,timestamp) VALUES ('p',1,1);");
   g_conn->Exec("COMMIT;");
   (void)g_provider->Initialize();
+}
+
+// The bare prepared insert of the row InsertRow writes, with the columns it fills itself.
+class BareInsert {
+ public:
+  BareInsert() {
+    if (sqlite3_prepare_v2(g_conn->Handle(),
+                           "INSERT INTO use_app_survey(app_id,duration,timestamp,time_zone) "
+                           "VALUES (?,?,?,?);",
+                           -1, &stmt_, nullptr) != SQLITE_OK)
+      abort();
+  }
+  ~BareInsert() { sqlite3_finalize(stmt_); }
+  bool Run() {
+    sqlite3_bind_text(stmt_, 1, "com.example.clock", -1, SQLITE_STATIC);
+    sqlite3_bind_int64(stmt_, 2, 184230);
+    sqlite3_bind_int64(stmt_, 3, WallClockMs());
+    sqlite3_bind_text(stmt_, 4, "Europe/Berlin", -1, SQLITE_STATIC);
+    bool done = sqlite3_step(stmt_) == SQLITE_DONE;
+    sqlite3_reset(stmt_);
+    return done;
+  }
+
+ private:
+  sqlite3_stmt* stmt_ = nullptr;
+};
+
+// Drops the oldest batch the bare inserts added at the limit, untimed, where InsertRow trims.
+void TrimBare() {
+  g_conn->Exec(
+      "DELETE FROM use_app_survey WHERE _id < (SELECT MIN(_id) FROM use_app_survey) + 500;");
 }
 
 // Keeps an "empty" table near empty between batches (untimed).
@@ -88,31 +114,18 @@ void BM_InsertRow(benchmark::State& state) {
 void BM_BarePreparedInsert(benchmark::State& state) {
   int start = static_cast<int>(state.range(0));
   Prefill(start);
-  sqlite3_stmt* stmt = nullptr;
-  if (sqlite3_prepare_v2(g_conn->Handle(),
-                         "INSERT INTO use_app_survey(app_id,duration,timestamp,time_zone) "
-                         "VALUES (?,?,?,?);",
-                         -1, &stmt, nullptr) != SQLITE_OK)
-    abort();
+  BareInsert bare;
   int64_t done = 0;
   for (auto _ : state) {
-    sqlite3_bind_text(stmt, 1, "com.example.clock", -1, SQLITE_STATIC);
-    sqlite3_bind_int64(stmt, 2, 184230);
-    sqlite3_bind_int64(stmt, 3, WallClockMs());
-    sqlite3_bind_text(stmt, 4, "Europe/Berlin", -1, SQLITE_STATIC);
-    if (sqlite3_step(stmt) != SQLITE_DONE) state.SkipWithError("insert failed");
-    sqlite3_reset(stmt);
+    if (!bare.Run()) state.SkipWithError("insert failed");
     MaybeEmpty(state, start, ++done);
     // At the limit the bare table is held there too, untimed, so both see the same size.
     if (start == kLimit && done % kBatch == 0) {
       state.PauseTiming();
-      g_conn->Exec(
-          "DELETE FROM use_app_survey WHERE _id < (SELECT MIN(_id) FROM "
-          "use_app_survey) + 500;");
+      TrimBare();
       state.ResumeTiming();
     }
   }
-  sqlite3_finalize(stmt);
   state.counters["rows_at_end"] = g_conn->Count("use_app_survey");
 }
 
@@ -146,12 +159,7 @@ Interleaved g_interleaved[2];
 void BM_InsertRowInterleavedWithBare(benchmark::State& state) {
   int start = static_cast<int>(state.range(0));
   Prefill(start);
-  sqlite3_stmt* stmt = nullptr;
-  if (sqlite3_prepare_v2(g_conn->Handle(),
-                         "INSERT INTO use_app_survey(app_id,duration,timestamp,time_zone) "
-                         "VALUES (?,?,?,?);",
-                         -1, &stmt, nullptr) != SQLITE_OK)
-    abort();
+  BareInsert bareInsert;
   Interleaved sum;
   int64_t done = 0;
   auto insertRow = [&] {
@@ -163,12 +171,7 @@ void BM_InsertRowInterleavedWithBare(benchmark::State& state) {
   };
   auto bare = [&] {
     double cpu = CpuUs(), wall = WallUs();
-    sqlite3_bind_text(stmt, 1, "com.example.clock", -1, SQLITE_STATIC);
-    sqlite3_bind_int64(stmt, 2, 184230);
-    sqlite3_bind_int64(stmt, 3, WallClockMs());
-    sqlite3_bind_text(stmt, 4, "Europe/Berlin", -1, SQLITE_STATIC);
-    if (sqlite3_step(stmt) != SQLITE_DONE) state.SkipWithError("insert failed");
-    sqlite3_reset(stmt);
+    if (!bareInsert.Run()) state.SkipWithError("insert failed");
     sum.bareCpu += CpuUs() - cpu;
     sum.bareWall += WallUs() - wall;
   };
@@ -186,14 +189,11 @@ void BM_InsertRowInterleavedWithBare(benchmark::State& state) {
       if (start == 0) {
         Prefill(0);
       } else {  // the bare inserts' share; InsertRow trims its own
-        g_conn->Exec(
-            "DELETE FROM use_app_survey WHERE _id < (SELECT MIN(_id) FROM "
-            "use_app_survey) + 500;");
+        TrimBare();
       }
       state.ResumeTiming();
     }
   }
-  sqlite3_finalize(stmt);
   double n = static_cast<double>(state.iterations());
   Interleaved& out = g_interleaved[start == 0 ? 0 : 1];
   out = {sum.insertCpu / n, sum.insertWall / n, sum.bareCpu / n, sum.bareWall / n};
@@ -217,17 +217,12 @@ int main(int argc, char** argv) {
   Teardown();
   // Wall time includes the journal's fsync, which dominates on a real disk; CPU time shows
   // what the provider itself adds.
-  for (auto* times : {&reporter.wall, &reporter.cpu}) {
-    auto find = [&](const std::string& prefix) { return RatioReporter::Find(*times, prefix); };
-    double empty = find("BM_InsertRow/0"), full = find("BM_InsertRow/5000");
-    double bareEmpty = find("BM_BarePreparedInsert/0");
-    double bareFull = find("BM_BarePreparedInsert/5000");
-    if (empty <= 0 || full <= 0 || bareEmpty <= 0 || bareFull <= 0) continue;
-    const char* kind = times == &reporter.wall ? "wall" : "cpu ";
-    printf("%s InsertRow / bare insert, empty table:     %.2f\n", kind, empty / bareEmpty);
-    printf("%s InsertRow / bare insert, at 5,000 rows:   %.2f\n", kind, full / bareFull);
-    printf("%s InsertRow at 5,000 rows / empty table:    %.2f\n", kind, full / empty);
-  }
+  reporter.PrintRatio("InsertRow / bare insert, empty table", "BM_InsertRow/0",
+                      "BM_BarePreparedInsert/0");
+  reporter.PrintRatio("InsertRow / bare insert, at 5,000 rows", "BM_InsertRow/5000",
+                      "BM_BarePreparedInsert/5000");
+  reporter.PrintRatio("InsertRow at 5,000 rows / empty table", "BM_InsertRow/5000",
+                      "BM_InsertRow/0");
   // The same ratios from the interleaved runs, per insert.
   for (int i = 0; i < 2; ++i) {
     const Interleaved& t = g_interleaved[i];

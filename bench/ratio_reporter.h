@@ -4,6 +4,7 @@
 #define LOGMGR_BENCH_RATIO_REPORTER_H_
 
 #include <benchmark/benchmark.h>
+#include <stdio.h>
 
 #include <map>
 #include <string>
@@ -29,6 +30,17 @@ class RatioReporter : public benchmark::ConsoleReporter {
       if (name.rfind(prefix, 0) == 0) return value;
     }
     return 0.0;
+  }
+
+  // Prints the ratio of the first benchmarks whose names start with |num| and |den|, in wall
+  // and then CPU time; nothing for a clock where either did not run.
+  void PrintRatio(const std::string& label, const std::string& num, const std::string& den) const {
+    for (const auto* times : {&wall, &cpu}) {
+      double n = Find(*times, num), d = Find(*times, den);
+      if (n > 0 && d > 0) {
+        printf("%s %-44s %.3f\n", times == &wall ? "wall" : "cpu ", label.c_str(), n / d);
+      }
+    }
   }
 
   std::map<std::string, double> wall;

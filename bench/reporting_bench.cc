@@ -22,6 +22,7 @@
 #include "reporting/uploader.h"
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -61,10 +62,6 @@ class Device {
     setenv("TZ", "Europe/Berlin", 1);
     tzset();
     setenv("DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/nonexistent/bus", 1);
-    char tmpl[] = "/tmp/logmgr-bench-XXXXXX";
-    sysroot = mkdtemp(tmpl);
-    (void)system(("mkdir -p " + sysroot + "/opt/usr/dbspace").c_str());
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
     (void)ProviderRegistry::GetInstance()->CreateProviders();
     (void)DbManager::GetInstance()->Init();
     (void)UploadDbManager::GetInstance()->Init();
@@ -91,7 +88,6 @@ class Device {
     ProviderRegistry::Release();
     DbManager::CloseInstance();
     UploadDbManager::CloseInstance();
-    (void)system(("rm -rf " + sysroot).c_str());
   }
 
   // 5000 rows in each aggregated table, evenly over the day, 40 apps and 10 features.
@@ -125,7 +121,8 @@ class Device {
     (void)upload->Exec("DELETE FROM survey_log;");
   }
 
-  std::string sysroot;
+  TempSysroot root{"bench", {"/opt/usr/dbspace"}};
+  const std::string sysroot = root.path();
   PrefStore prefs;
   const std::string appId = "com.corvane.logmanager";
   DbConnection* survey = nullptr;

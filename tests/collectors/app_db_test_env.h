@@ -16,6 +16,7 @@
 
 #include "include/provider_registry.h"
 #include "storage/db_manager.h"
+#include "tests/sqlite_rows.h"
 #include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
@@ -84,22 +85,7 @@ class AppDbTest : public ::testing::Test {
 
   // Rows of |sql| on the survey database, columns joined by ':' and rows ended by ';'.
   std::string Rows(const std::string& sql) {
-    sqlite3* db = nullptr;
-    sqlite3_open_v2((sysroot + "/opt/usr/dbspace/.SurveyLog.db").c_str(), &db, SQLITE_OPEN_READONLY,
-                    nullptr);
-    sqlite3_stmt* stmt = nullptr;
-    std::string out;
-    if (sqlite3_prepare_v2(db, sql.c_str(), -1, &stmt, nullptr) != SQLITE_OK) out = "<error>";
-    while (stmt != nullptr && sqlite3_step(stmt) == SQLITE_ROW) {
-      for (int i = 0; i < sqlite3_column_count(stmt); ++i) {
-        const unsigned char* text = sqlite3_column_text(stmt, i);
-        out += (i > 0 ? ":" : "") + std::string(text ? reinterpret_cast<const char*>(text) : "");
-      }
-      out += ";";
-    }
-    sqlite3_finalize(stmt);
-    sqlite3_close(db);
-    return out;
+    return FileRows(sysroot + "/opt/usr/dbspace/.SurveyLog.db", sql);
   }
 
   TempSysroot tmp{"apps"};

@@ -58,14 +58,6 @@ class CrashMonitorTest : public AppDbTest {
   CrashMonitor monitor{ProviderRegistry::GetInstance()};
 };
 
-TEST_F(CrashMonitorTest, WritesOneRowPerAppOfTheExecutable) {
-  Install("com.ex.shared.one", "pkg.shared", "/usr/apps/shared/bin/shared");
-  Install("com.ex.shared.two", "pkg.shared", "/usr/apps/shared/bin/shared");
-  Install("com.ex.other", "pkg.other", "/usr/apps/other/bin/other");
-  Crash("/usr/apps/shared/bin/shared");
-  EXPECT_EQ(Errors(), "com.ex.shared.one:1;com.ex.shared.two:1;");
-}
-
 // Malformed signals and unknown executables also run through the daemon in the system tests.
 TEST_F(CrashMonitorTest, IgnoresOtherSignalsAndUnreadableAppData) {
   Install("com.ex.app", "pkg.app", "/usr/apps/app/bin/app");

@@ -11,6 +11,7 @@
 #include "storage/db_manager.h"
 #include "storage/pref_store.h"
 #include "storage/status_snapshot_store.h"
+#include "tests/sqlite_rows.h"
 #include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
@@ -36,25 +37,9 @@ class DeviceStatusMonitorTest : public ::testing::Test {
   }
   // Feature rows as "app|feature|extra|value;" in insertion order.
   std::string Rows() {
-    sqlite3* db = nullptr;
-    std::string path = sysroot + "/opt/usr/dbspace/.SurveyLog.db";
-    EXPECT_EQ(sqlite3_open_v2(path.c_str(), &db, SQLITE_OPEN_READONLY, nullptr), SQLITE_OK);
-    sqlite3_stmt* stmt = nullptr;
-    sqlite3_prepare_v2(db,
-                       "SELECT app_id, feature, extra, value FROM use_app_feature_survey "
-                       "ORDER BY _id",
-                       -1, &stmt, nullptr);
-    std::string out;
-    while (sqlite3_step(stmt) == SQLITE_ROW) {
-      for (int i = 0; i < 4; ++i) {
-        const unsigned char* text = sqlite3_column_text(stmt, i);
-        out += text != nullptr ? reinterpret_cast<const char*>(text) : "NULL";
-        out += i < 3 ? "|" : ";";
-      }
-    }
-    sqlite3_finalize(stmt);
-    sqlite3_close(db);
-    return out;
+    return FileRows(sysroot + "/opt/usr/dbspace/.SurveyLog.db",
+                    "SELECT app_id, feature, extra, value FROM use_app_feature_survey ORDER BY _id",
+                    "|", "NULL");
   }
   int64_t OpenedAt(const char* code) {
     std::string extra;

@@ -32,18 +32,6 @@ class PackageMonitorTest : public AppDbTest {
   std::unique_ptr<PackageMonitor> monitor;
 };
 
-TEST_F(PackageMonitorTest, WritesTheAnnouncedKindOnceTheRequestEndsWell) {
-  Status("pkg.a", "start", "install");
-  Status("pkg.a", "install_percent", "50");
-  EXPECT_EQ(Managed(), "");
-  Status("pkg.a", "end", "ok");
-  Status("pkg.b", "start", "update");
-  Status("pkg.b", "end", "ok");
-  Status("pkg.c", "start", "uninstall");
-  Status("pkg.c", "end", "ok");
-  EXPECT_EQ(Managed(), "pkg.a:0;pkg.b:2;pkg.c:1;");
-}
-
 TEST_F(PackageMonitorTest, OnlyAnAnnouncedRequestIsWrittenAndOnlyOnce) {
   Status("pkg.a", "end", "ok");      // no start seen
   Status("pkg.a", "start", "move");  // not a kind written here

@@ -13,6 +13,7 @@
 #include <string>
 
 #include "include/db_connection.h"
+#include "tests/temp_sysroot.h"
 
 namespace fuzz_checks {
 
@@ -92,10 +93,7 @@ class BusStatementBench {
   static constexpr int kRows = 6;
 
   BusStatementBench() {
-    char tmpl[] = "/tmp/logmgr-fuzz-bus-XXXXXX";
-    if (mkdtemp(tmpl) == nullptr) abort();
-    dir = tmpl;
-    std::string path = dir + "/bus.db";
+    std::string path = dir.Path("/bus.db");
     if (conn.Open(path.c_str()) != 0) abort();
     conn.SetBusCpuBudgetMs(20);
     {
@@ -115,7 +113,6 @@ class BusStatementBench {
   ~BusStatementBench() {
     sqlite3_close(plain);
     (void)conn.Close();
-    (void)system(("rm -rf '" + dir + "'").c_str());
   }
 
   // Values near the integer limit, so that SUM and arithmetic overflow.
@@ -150,7 +147,7 @@ class BusStatementBench {
   // find a statement that never ends.
   static int Bound(void* self) { return ++static_cast<BusStatementBench*>(self)->steps > 20000; }
 
-  std::string dir;
+  TempSysroot dir{"fuzz-bus"};
   _CorvaneLogManager::DbConnection conn;
   sqlite3* plain = nullptr;
   int steps = 0;

@@ -235,29 +235,6 @@ TEST_F(BaseLogProviderTest, KeptInsertsStoreAndAnswerAsTheTextWould) {
   sqlite3_close(raw);
 }
 
-// A bus request may only touch its own table, so the statement the daemon keeps for a table
-// must not serve a request of another table's scope.
-TEST_F(BaseLogProviderTest, AKeptInsertServesNoOtherScopesTable) {
-  ASSERT_EQ(useApp->InsertRow("app_id,duration", "'daemon',1"), 0);
-  {
-    DbConnection::BusRequestScope request(survey, "use_app_feature_survey");
-    ASSERT_TRUE(request.Held());
-    int32_t rowId = 0;
-    EXPECT_EQ(useApp->InsertRow("app_id,duration", "'other',2", &rowId), -1);
-    EXPECT_EQ(rowId, -1);
-  }
-  {
-    DbConnection::BusRequestScope request(survey, "use_app_survey");
-    EXPECT_EQ(useApp->InsertRow("app_id,duration", "'own',3"), 0);
-  }
-  {
-    DbConnection::BusRequestScope request(survey, "use_app_feature_survey");
-    EXPECT_EQ(useApp->InsertRow("app_id,duration", "'other',4"), -1) << "nor the request's";
-  }
-  EXPECT_EQ(useApp->InsertRow("app_id,duration", "'daemon',5"), 0);
-  EXPECT_EQ(Query(survey, "SELECT group_concat(app_id) FROM use_app_survey"), "daemon,own,daemon");
-}
-
 // One-step statements are cut by the buffer; lists and appended clauses that would not fit
 // end the process before anything is written past a buffer.
 using BaseLogProviderDeathTest = BaseLogProviderTest;

@@ -132,56 +132,6 @@ TEST_F(ProviderBusFitTest, LargestAcceptedStatementsRunWholeAndOneMoreIsRefused)
   EXPECT_EQ(LastStatement("DELETE").size(), 1023u);
 }
 
-TEST(ProviderBusGuardTest, ABusRequestScopeConfinesStatementsToTheOwnTableWhileAlive) {
-  char tmpl[] = "/tmp/logmgr-busscope-XXXXXX";
-  ASSERT_NE(mkdtemp(tmpl), nullptr);
-  std::string dir = tmpl;
-  DbConnection conn;
-  ASSERT_EQ(conn.Open((dir + "/t.db").c_str()), 0);
-  {
-    DbConnection::SetupScope setup(&conn);
-    ASSERT_EQ(conn.Exec("CREATE TABLE own(a);"), 0);
-    ASSERT_EQ(conn.Exec("CREATE TABLE other(b);"), 0);
-  }
-  const struct {
-    const char* sql;
-    bool allowed;
-  } cases[] = {
-      {"INSERT INTO own(a) VALUES ('x');", true},
-      {"UPDATE own SET a = upper(a) WHERE a IN (SELECT a FROM own);", true},
-      {"SELECT count(*), max(a) FROM own;", true},
-      {"DELETE FROM own WHERE a = 'y';", true},
-      {"SELECT a, (SELECT b FROM other) FROM own;", false},
-      {"DELETE FROM own WHERE a IN (SELECT b FROM other);", false},
-      {"INSERT INTO other(b) VALUES (1);", false},
-      {"SELECT name FROM sqlite_master;", false},
-      {"ATTACH DATABASE ':memory:' AS x;", false},
-      {"PRAGMA user_version = 3;", false},
-      {"PRAGMA user_version;", false},
-      {"DROP TABLE other;", false},
-      {"CREATE TABLE x(c);", false},
-      {"BEGIN;", false},
-      {"VACUUM;", false},
-      {"WITH RECURSIVE r(n) AS (SELECT 1 UNION ALL SELECT n + 1 FROM r) SELECT n FROM r;", false},
-      {"SELECT randomblob(10) FROM own;", false},
-      {"SELECT replace(printf('%.1000000c', 'x'), 'x', 'xx') FROM own;", false},
-      {"DELETE FROM own WHERE 1; DELETE FROM other;", false},
-  };
-  {
-    DbConnection::BusRequestScope request(&conn, "own");
-    ASSERT_TRUE(request.Held());
-    for (const auto& c : cases) {
-      SCOPED_TRACE(c.sql);
-      EXPECT_EQ(conn.Exec(c.sql), c.allowed ? 0 : -1);
-    }
-  }
-  // Afterwards the daemon's own statements reach every table again.
-  EXPECT_EQ(conn.Exec("INSERT INTO other(b) SELECT a FROM own;"), 0);
-  EXPECT_EQ(conn.Count("other"), 1);
-  EXPECT_EQ(conn.Close(), 0);
-  (void)system(("rm -rf " + dir).c_str());
-}
-
 // The first |count| rows of "x,1," and "y,2,", owned as a select hands them out.
 void TwoRowResult(int count, QueryRows* rows) {
   rows->Reset();

@@ -8,6 +8,7 @@
 #include <stdlib.h>
 #include <unistd.h>
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -16,6 +17,7 @@
 #include "include/db_connection.h"
 #include "include/provider_registry.h"
 #include "storage/db_manager.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 
@@ -64,29 +66,18 @@ struct StatementTrace {
 class ProviderTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-providers-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    ASSERT_EQ(system(("mkdir -p " + sysroot + "/opt/usr/dbspace " + sysroot + "/opt/etc").c_str()),
-              0);
+    root.reset(new TempSysroot("providers", {"/opt/usr/dbspace"}));
+    sysroot = root->path();
     SetLocaltimeLink("/usr/share/zoneinfo/Europe/Berlin");
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
   }
   void TearDown() override {
     ProviderRegistry::Release();
     DbManager::CloseInstance();
     UploadDbManager::CloseInstance();
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf " + sysroot).c_str());
+    root.reset();
   }
   // Empty target: no link at all.
-  void SetLocaltimeLink(const std::string& target) {
-    std::string link = sysroot + "/opt/etc/localtime";
-    unlink(link.c_str());
-    if (!target.empty()) {
-      EXPECT_EQ(symlink(target.c_str(), link.c_str()), 0);
-    }
-  }
+  void SetLocaltimeLink(const std::string& target) { EXPECT_TRUE(root->SetLocaltime(target)); }
   // The daemon's start order: registry first, then both files opened.
   void StartProviders() {
     ASSERT_NE(DbManager::GetInstance(), nullptr);
@@ -130,6 +121,7 @@ class ProviderTest : public ::testing::Test {
     surveyTrace.paused = uploadTrace.paused = false;
   }
 
+  std::unique_ptr<TempSysroot> root;
   std::string sysroot;
   DbConnection* survey = nullptr;
   DbConnection* upload = nullptr;

@@ -5,8 +5,10 @@
 #include <stdlib.h>
 #include <system_info.h>
 
-#include <fstream>
+#include <memory>
 #include <string>
+
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -30,10 +32,8 @@ std::string Shell(const std::string& command) {
 class DeviceIdentityTest : public ::testing::Test {
  protected:
   static void SetUpTestSuite() {
-    char tmpl[] = "/tmp/logmgr-identity-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    std::string out = Shell(SourceDir() + "/scripts/host-env start " + sysroot +
+    root.reset(new TempSysroot("identity"));
+    std::string out = Shell(SourceDir() + "/scripts/host-env start " + root->path() +
                             " --no-x --mock 'ofono={\"MobileCountryCode\": \"450\", "
                             "\"MobileNetworkCode\": \"05\"}'");
     size_t at = out.find("DBUS_SYSTEM_BUS_ADDRESS=");
@@ -44,26 +44,21 @@ class DeviceIdentityTest : public ::testing::Test {
     }
   }
   static void TearDownTestSuite() {
-    (void)Shell(SourceDir() + "/scripts/host-env stop " + sysroot);
-    (void)system(("rm -rf " + sysroot).c_str());
+    (void)Shell(SourceDir() + "/scripts/host-env stop " + root->path());
+    root.reset();
   }
 
   void SetUp() override {
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
+    setenv("LOGMGR_SYSROOT", root->path().c_str(), 1);
     setenv("DBUS_SYSTEM_BUS_ADDRESS", busAddress.c_str(), 1);
-    ASSERT_EQ(system(("mkdir -p " + sysroot + "/etc " + sysroot + "/sys/class/dmi/id " + sysroot +
-                      "/sys/firmware/devicetree/base")
-                         .c_str()),
-              0);
-    Write("/etc/os-release", "VERSION_ID=12\n");
-    Write("/sys/class/dmi/id/product_name", "Board 7\n");
-    (void)unlink((sysroot + "/sys/firmware/devicetree/base/model").c_str());
+    ASSERT_TRUE(Write("/etc/os-release", "VERSION_ID=12\n"));
+    ASSERT_TRUE(Write("/sys/class/dmi/id/product_name", "Board 7\n"));
+    ASSERT_TRUE(root->MakeDir("/sys/firmware/devicetree/base"));
+    (void)unlink(root->Path("/sys/firmware/devicetree/base/model").c_str());
   }
   void TearDown() override { unsetenv("LOGMGR_SYSROOT"); }
 
-  void Write(const std::string& path, const std::string& text) {
-    std::ofstream(sysroot + path, std::ios::binary) << text;
-  }
+  bool Write(const std::string& path, const std::string& text) { return root->Write(path, text); }
   void Sim(const std::string& properties) {
     ASSERT_EQ(Shell("DBUS_SYSTEM_BUS_ADDRESS='" + busAddress +
                     "' gdbus call --system --dest "
@@ -74,10 +69,10 @@ class DeviceIdentityTest : public ::testing::Test {
               std::string::npos);
   }
 
-  static std::string sysroot;
+  static std::unique_ptr<TempSysroot> root;
   static std::string busAddress;
 };
-std::string DeviceIdentityTest::sysroot;
+std::unique_ptr<TempSysroot> DeviceIdentityTest::root;
 std::string DeviceIdentityTest::busAddress;
 
 std::string Text(const char* value) { return value != nullptr ? value : "<absent>"; }
@@ -139,7 +134,7 @@ TEST_F(DeviceIdentityTest, SystemInfoReadsTheSysrootFiles) {
       {"ID=debian\nVERSION_ID=\"12\"\n", nullptr, nullptr, "12", nullptr},
       {"", nullptr, nullptr, nullptr, nullptr},
   };
-  std::string base = sysroot + "/sys/";
+  std::string base = root->Path("/sys/");
   for (const Case& c : cases) {
     SCOPED_TRACE(c.osRelease);
     Write("/etc/os-release", c.osRelease);

@@ -110,26 +110,6 @@ TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
   EXPECT_EQ(Column(upload, "SELECT count(*) FROM survey_log"), std::vector<std::string>{"9"});
 }
 
-TEST_F(ReportBuilderTest, ThreeDaysBackAreProcessedOldestFirst) {
-  Now(2024, 6, 12, 10);
-  SentDate(2024, 6, 8);
-  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 10, 12), "'m.two',0");
-  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 9, 12), "'m.one',0");
-
-  ASSERT_EQ(builder->RunDaily(), 0);
-
-  std::vector<std::string> summaryDates;
-  for (const std::string& body : Bodies("007"))
-    summaryDates.push_back(body.substr(kHead.size(), 29));
-  EXPECT_EQ(summaryDates, (std::vector<std::string>{"date=2024-06-09T00:00:00+0200",
-                                                    "date=2024-06-10T00:00:00+0200",
-                                                    "date=2024-06-11T00:00:00+0200"}));
-  EXPECT_EQ(Bodies("003"), (std::vector<std::string>{
-                               kHead + "date=2024-06-09T12:00:00+0200¶app_id=m.one¶type=0",
-                               kHead + "date=2024-06-10T12:00:00+0200¶app_id=m.two¶type=0"}));
-  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
-}
-
 TEST_F(ReportBuilderTest, ManageRowInTheLastSecondIsDroppedUnreportedByTheNextDay) {
   Now(2024, 6, 10, 10);
   SentDate(2024, 6, 8);

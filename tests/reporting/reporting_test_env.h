@@ -1,4 +1,4 @@
-// Fixture of the reporting tests: a temp sysroot with real database files, the real registry and
+// Fixture of the reporting tests: the provider fixture's real database files, registry and
 // managers, a fixed time zone and an injectable clock.
 #ifndef LOGMGR_TESTS_REPORTING_REPORTING_TEST_ENV_H_
 #define LOGMGR_TESTS_REPORTING_REPORTING_TEST_ENV_H_
@@ -14,11 +14,9 @@
 #include <string>
 #include <vector>
 
-#include "include/db_connection.h"
-#include "include/provider_registry.h"
 #include "reporting/report_context.h"
-#include "storage/db_manager.h"
 #include "storage/pref_store.h"
+#include "tests/providers/provider_test_env.h"
 
 namespace _CorvaneLogManager {
 
@@ -26,39 +24,25 @@ inline int64_t g_testNowMs = 0;
 inline int64_t TestClock() { return g_testNowMs; }
 inline bool TestReportEnabled() { return true; }
 
-class ReportingTest : public ::testing::Test {
+// The provider fixture's sysroot, registry and managers, with the files the record header reads
+// and the preference store.
+class ReportingTest : public ProviderTest {
  protected:
   void SetUp() override {
     setenv("TZ", "Europe/Berlin", 1);
     tzset();
     // No telephony service: the operator codes stay unknown unless a test brings a bus.
     setenv("DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/nonexistent/bus", 1);
-    char tmpl[] = "/tmp/logmgr-reporting-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    sysroot = tmpl;
-    ASSERT_EQ(system(("mkdir -p " + sysroot + "/opt/usr/dbspace " + sysroot + "/etc " + sysroot +
-                      "/sys/class/dmi/id")
-                         .c_str()),
-              0);
+    ProviderTest::SetUp();
     WriteFile("/etc/os-release", "NAME=\"Test OS\"\nVERSION_ID=\"12\"\nBUILD_ID=W2.3-K9\n");
     WriteFile("/sys/class/dmi/id/product_name", "Gear-X1\n");
-    setenv("LOGMGR_SYSROOT", sysroot.c_str(), 1);
-
-    ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
-    ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
-    ASSERT_EQ(UploadDbManager::GetInstance()->Init(), 0);
-    survey = DbManager::GetInstance()->GetConnection();
-    upload = UploadDbManager::GetInstance()->GetConnection();
+    StartProviders();
     ASSERT_EQ(prefs.Create(), 0);
   }
 
   void TearDown() override {
     (void)prefs.Close();
-    ProviderRegistry::Release();
-    DbManager::CloseInstance();
-    UploadDbManager::CloseInstance();
-    unsetenv("LOGMGR_SYSROOT");
-    (void)system(("rm -rf " + sysroot).c_str());
+    ProviderTest::TearDown();
   }
 
   // What the daemon hands the report run, with the test clock.
@@ -75,7 +59,7 @@ class ReportingTest : public ::testing::Test {
   }
 
   void WriteFile(const std::string& fixedPath, const std::string& text) {
-    std::ofstream(sysroot + fixedPath, std::ios::binary) << text;
+    ASSERT_TRUE(root->Write(fixedPath, text)) << fixedPath;
   }
   std::string ReadFile(const std::string& fixedPath) {
     std::ifstream in(sysroot + fixedPath, std::ios::binary);
@@ -123,9 +107,6 @@ class ReportingTest : public ::testing::Test {
     return out;
   }
 
-  std::string sysroot;
-  DbConnection* survey = nullptr;
-  DbConnection* upload = nullptr;
   PrefStore prefs;
   const std::string appId = "com.corvane.logmanager";
 };

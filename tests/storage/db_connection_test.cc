@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "storage/key_derivation.h"
+#include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -23,18 +24,8 @@ using Rows = std::vector<std::string>;
 
 class DbConnectionTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    char tmpl[] = "/tmp/logmgr-dbconn-XXXXXX";
-    ASSERT_NE(mkdtemp(tmpl), nullptr);
-    dir = tmpl;
-    path = dir + "/test.db";
-    ASSERT_EQ(conn.Open(path.c_str()), 0);
-  }
-  void TearDown() override {
-    (void)conn.Close();
-    (void)chmod(dir.c_str(), 0700);
-    (void)system(("rm -rf '" + dir + "'").c_str());
-  }
+  void SetUp() override { ASSERT_EQ(conn.Open(path.c_str()), 0); }
+  void TearDown() override { (void)conn.Close(); }
   // Runs each statement in the open phase, the only time tables may be made.
   void Setup(std::initializer_list<const char*> statements) {
     DbConnection::SetupScope setup(&conn);
@@ -58,37 +49,11 @@ class DbConnectionTest : public ::testing::Test {
     if (count > 0) delete[] rows;
     return out;
   }
-  std::string dir;
-  std::string path;
+  TempSysroot tmp{"dbconn"};
+  const std::string dir = tmp.path();
+  const std::string path = dir + "/test.db";
   DbConnection conn;
 };
-
-TEST_F(DbConnectionTest, RendersColumnsAsCommaTerminatedTexts) {
-  const std::string t298(298, 'y'), t400(400, 'z');
-  struct Case {
-    const char* name;
-    std::string values;
-    std::string want;
-  } cases[] = {
-      {"the example row", "42, 'abc', NULL, 1.5", "42,abc,1.500000,"},
-      {"NULL between", "7, NULL, 'x', NULL", "7,x,"},
-      {"all NULL", "NULL, NULL, NULL, NULL", ""},
-      {"blob read to its NUL", "x'61620063', x'', NULL, NULL", "ab,,"},
-      {"text of 298 keeps its comma", "'" + t298 + "', NULL, NULL, NULL", t298 + ","},
-      {"text of 400 cut at 299", "'" + t400 + "', 7, NULL, NULL", t400.substr(0, 299) + "7,"},
-      {"widest integer cut at 19", "-9223372036854775808, NULL, NULL, NULL", "-922337203685477580"},
-  };
-  Setup({"CREATE TABLE t(id INTEGER PRIMARY KEY, a, b, c, d);"});
-  for (const Case& c : cases) {
-    ASSERT_EQ(conn.Exec(("INSERT INTO t(a, b, c, d) VALUES(" + c.values + ");").c_str()), 0);
-  }
-  Rows rows = Select("SELECT a, b, c, d FROM t ORDER BY id;", "t");
-  ASSERT_EQ(rows.size(), sizeof(cases) / sizeof(cases[0]));
-  for (size_t i = 0; i < rows.size(); ++i) {
-    SCOPED_TRACE(cases[i].name);
-    EXPECT_EQ(rows[i], cases[i].want);
-  }
-}
 
 // The cells as the formatted rendering made them, cell by cell into buffers of the cell's size.
 std::string FormattedRow(sqlite3_stmt* stmt) {
@@ -469,9 +434,34 @@ TEST_F(DbConnectionTest, ABusRequestTouchesOneTableWithinItsBudgetAndResultLimit
   {
     DbConnection::BusRequestScope request(&conn, "own");
     ASSERT_TRUE(request.Held());
-    EXPECT_EQ(conn.Exec("DELETE FROM own WHERE a = 'none';"), 0);
-    EXPECT_EQ(conn.Exec("INSERT INTO other VALUES(1);"), -1);
-    EXPECT_EQ(conn.Exec("DELETE FROM own WHERE a IN (SELECT b FROM other);"), -1);
+    const struct {
+      const char* sql;
+      bool allowed;
+    } cases[] = {
+        {"INSERT INTO own(a) VALUES ('x');", true},
+        {"UPDATE own SET a = upper(a) WHERE a IN (SELECT a FROM own);", true},
+        {"SELECT count(*), max(a) FROM own;", true},
+        {"DELETE FROM own WHERE a = 'X';", true},  // the row inserted above, upper-cased
+        {"SELECT a, (SELECT b FROM other) FROM own;", false},
+        {"DELETE FROM own WHERE a IN (SELECT b FROM other);", false},
+        {"INSERT INTO other(b) VALUES (1);", false},
+        {"SELECT name FROM sqlite_master;", false},
+        {"ATTACH DATABASE ':memory:' AS x;", false},
+        {"PRAGMA user_version = 3;", false},
+        {"PRAGMA user_version;", false},
+        {"DROP TABLE other;", false},
+        {"CREATE TABLE x(c);", false},
+        {"BEGIN;", false},
+        {"VACUUM;", false},
+        {"WITH RECURSIVE r(n) AS (SELECT 1 UNION ALL SELECT n + 1 FROM r) SELECT n FROM r;", false},
+        {"SELECT randomblob(10) FROM own;", false},
+        {"SELECT replace(printf('%.1000000c', 'x'), 'x', 'xx') FROM own;", false},
+        {"DELETE FROM own WHERE 1; DELETE FROM other;", false},
+    };
+    for (const auto& c : cases) {
+      SCOPED_TRACE(c.sql);
+      EXPECT_EQ(conn.Exec(c.sql), c.allowed ? 0 : -1);
+    }
     // The scope is this thread's: the worker's statements meanwhile stay the daemon's own.
     EXPECT_EQ((OtherThread{&conn, "INSERT INTO other VALUES(2);"}.Go()), 0);
     DbConnection::SetupScope nested(&conn);  // a second scope is never entered
@@ -487,6 +477,9 @@ TEST_F(DbConnectionTest, ABusRequestTouchesOneTableWithinItsBudgetAndResultLimit
     EXPECT_EQ(conn.Exec("DELETE FROM own WHERE a IN (SELECT a.a FROM own a, own b, own c);"), -1);
   }
   EXPECT_EQ(conn.Count("own"), 200) << "the stopped delete changed nothing";
+  // Afterwards the daemon's own statements reach every table again.
+  EXPECT_EQ(conn.Exec("INSERT INTO other(b) SELECT a FROM own LIMIT 1;"), 0);
+  EXPECT_EQ(conn.Count("other"), 2);
   // Every row renders as "row," plus a NUL, and one byte ends the result.
   for (size_t limit : {size_t{6}, size_t{5}, size_t{200 * 5 + 1}, size_t{200 * 5}}) {
     SCOPED_TRACE(limit);
@@ -646,13 +639,9 @@ TEST_F(DbConnectionTest, NewFilesAreOwnerOnlyWhateverTheUmask) {
 }
 
 TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
-  char tmpl[] = "/tmp/logmgr-keyed-XXXXXX";
-  ASSERT_NE(mkdtemp(tmpl), nullptr);
-  std::string root = tmpl;
-  std::string db = root + "/opt/usr/dbspace/keyed.db";
-  std::string lib = root + "/usr/lib/libsqlite3.so.0";
-  ASSERT_EQ(system(("mkdir -p '" + root + "/opt/usr/dbspace' '" + root + "/usr/lib'").c_str()), 0);
-  setenv("LOGMGR_SYSROOT", root.c_str(), 1);
+  TempSysroot root("keyed", {"/opt/usr/dbspace", "/usr/lib"});
+  std::string db = root.Path("/opt/usr/dbspace/keyed.db");
+  std::string lib = root.Path("/usr/lib/libsqlite3.so.0");
   SetDbEncryption(true);
   DbConnection conn;
   // No key library under the sysroot: the password file is made and the open goes on unkeyed.
@@ -670,20 +659,12 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   EXPECT_EQ(conn.Handle(), nullptr);
   // An empty key: the open fails, and the file stays as it was.
   ASSERT_EQ(unlink(lib.c_str()), 0);
-  ASSERT_EQ(truncate((root + "/opt/usr/dbspace/.SecurePassword.txt").c_str(), 0), 0);
+  ASSERT_EQ(truncate(root.Path("/opt/usr/dbspace/.SecurePassword.txt").c_str(), 0), 0);
   EXPECT_EQ(conn.Open(db.c_str()), -1);
   EXPECT_EQ(ReadKey(), "");
   SetDbEncryption(false);
   ReleaseKeyParams();
-  unsetenv("LOGMGR_SYSROOT");
-  (void)system(("rm -rf '" + root + "'").c_str());
 }
-
-}  // namespace
-}  // namespace _CorvaneLogManager
-
-namespace _CorvaneLogManager {
-namespace {
 
 // The report worker purges batches on the connection the main loop's bus requests use: a
 // request's count is its own statement's, whatever the other thread ran in between.

@@ -8,6 +8,7 @@
 
 #include <string>
 
+#include "tests/sqlite_rows.h"
 #include "tests/temp_sysroot.h"
 
 namespace _CorvaneLogManager {
@@ -17,30 +18,14 @@ class StatusSnapshotStoreTest : public ::testing::Test {
  protected:
   void TearDown() override { StatusSnapshotStore::DestroyInstance(); }
   StatusSnapshotStore* Open() {
-    std::string dir = sysroot + "/opt/usr/dbspace";
-    (void)system(("mkdir -p '" + dir + "'").c_str());
+    (void)tmp.MakeDir("/opt/usr/dbspace");
     return StatusSnapshotStore::GetInstance();
   }
   // Rows as stored, read past the store: "feature|extra|timestamp;" each.
   std::string Dump() {
-    sqlite3* db = nullptr;
-    std::string path = sysroot + "/opt/usr/dbspace/.StatusMonitor.db";
-    EXPECT_EQ(sqlite3_open_v2(path.c_str(), &db, SQLITE_OPEN_READONLY, nullptr), SQLITE_OK);
-    sqlite3_stmt* stmt = nullptr;
-    std::string out;
-    sqlite3_prepare_v2(db,
-                       "SELECT feature, extra, timestamp FROM survey_status_monitor "
-                       "ORDER BY feature",
-                       -1, &stmt, nullptr);
-    while (sqlite3_step(stmt) == SQLITE_ROW) {
-      out += reinterpret_cast<const char*>(sqlite3_column_text(stmt, 0));
-      out += "|";
-      out += reinterpret_cast<const char*>(sqlite3_column_text(stmt, 1));
-      out += "|" + std::to_string(sqlite3_column_int64(stmt, 2)) + ";";
-    }
-    sqlite3_finalize(stmt);
-    sqlite3_close(db);
-    return out;
+    return FileRows(sysroot + "/opt/usr/dbspace/.StatusMonitor.db",
+                    "SELECT feature, extra, timestamp FROM survey_status_monitor ORDER BY feature",
+                    "|");
   }
   TempSysroot tmp{"snapshot"};
   const std::string sysroot = tmp.path();

@@ -38,6 +38,16 @@ class MsClock:
         self._write()
 
 
+def root_watched(display_name):
+    """Whether someone (the daemon) watches the root window's properties on |display_name|."""
+    from Xlib import X, display
+    d = display.Display(display_name)
+    try:
+        return d.screen().root.get_attributes().all_event_masks & X.PropertyChangeMask
+    finally:
+        d.close()
+
+
 class AppCase(DeviceTestCase):
     WITH_X = True
     FROZEN = False  # the daemon's wall clock stands still until the test advances it
@@ -64,13 +74,7 @@ class AppCase(DeviceTestCase):
         wait_for(launched, timeout=30, interval=0.2, message="the daemon to watch the root window")
 
     def root_watched(self):
-        from Xlib import X, display
-        os.environ["DISPLAY"] = self.dev.env["DISPLAY"]
-        d = display.Display()
-        try:
-            return d.screen().root.get_attributes().all_event_masks & X.PropertyChangeMask
-        finally:
-            d.close()
+        return root_watched(self.dev.env["DISPLAY"])
 
     def focus(self, app, *extra):
         self.dev.devsim("app", "focus", app, *extra)

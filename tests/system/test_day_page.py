@@ -13,7 +13,7 @@ import zlib
 from unittest import mock
 
 from harness import DBSPACE, Device, wait_for
-from test_app_usage import MsClock
+from test_app_usage import MsClock, root_watched
 
 ZONE = "Asia/Seoul"
 DAY = "2026-03-10"  # the clock starts at 19:00 there
@@ -338,15 +338,6 @@ class DayPageTest(unittest.TestCase):
         # Screen, charger and the first app's bars are painted in their colours.
         for rgb in ((0xe0, 0xa5, 0x26), (0x59, 0xa1, 0x4f), (0x4e, 0x79, 0xa7)):
             self.assertGreater(colors.get(rgb, 0), 20, rgb)
-
-
-def root_watched(display_name):
-    from Xlib import X, display
-    d = display.Display(display_name)
-    try:
-        return d.screen().root.get_attributes().all_event_masks & X.PropertyChangeMask
-    finally:
-        d.close()
 
 
 if __name__ == "__main__":

@@ -7,42 +7,28 @@ import os
 import signal
 import sqlite3
 import subprocess
-import time
 
 import dbus
 
 from harness import DBSPACE, DeviceTestCase, wait_for
+from test_app_usage import MsClock
 
-FAKETIME_LIB = "/usr/lib/x86_64-linux-gnu/faketime/libfaketime.so.1"
 FEATURE_DB = ".SurveyLog.db"
 SNAPSHOT_DB = ".StatusMonitor.db"
 APP_ID = "com.corvane.logmanager"
 
 
-class FrozenClock:
-    """Wall time of the daemon, standing still until advanced."""
+class FrozenClock(MsClock):
+    """The daemon's wall clock in whole seconds, standing still until advanced."""
 
     def __init__(self, dev, start=1773136800):
-        self.path = os.path.join(dev.sysroot, "faketime")
-        self.now = start
-        self._write()
-        # A sanitizer build tolerates the preloaded clock only when told to.
-        asan = os.environ.get("ASAN_OPTIONS", "")
-        self.env = {"LD_PRELOAD": FAKETIME_LIB, "FAKETIME_TIMESTAMP_FILE": self.path,
-                    "FAKETIME_NO_CACHE": "1", "FAKETIME_DONT_FAKE_MONOTONIC": "1",
-                    "ASAN_OPTIONS": (asan + ":" if asan else "") + "verify_asan_link_order=0"}
-
-    def _write(self):
-        with open(self.path + ".tmp", "w") as f:
-            f.write(time.strftime("%Y-%m-%d %H:%M:%S\n", time.localtime(self.now)))
-        os.replace(self.path + ".tmp", self.path)
+        super().__init__(dev, start * 1000)
 
     def advance(self, seconds):
-        self.now += seconds
-        self._write()
+        self.advance_ms(seconds * 1000)
 
     def ms(self):
-        return self.now * 1000
+        return self.now_ms
 
 
 class DeviceStatusCase(DeviceTestCase):

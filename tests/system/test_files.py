@@ -14,6 +14,7 @@ from unittest import mock
 
 from harness import BIN_DIR, CONSENT_KEY, NOBODY, SOURCE_DIR, TIMEOUT_SCALE, VALGRIND, \
     DeviceTestCase, wait_for
+from test_app_usage import root_watched
 
 FEATURE = "use_app_feature_survey"
 UNIT = os.path.join(SOURCE_DIR, "packaging", "logmgrd.service")
@@ -130,14 +131,6 @@ class ForgedPlatformEventsTest(OpenBusCase):
     def rows(self, sql):
         return self.dev.query(".SurveyLog.db", sql)
 
-    def root_watched(self):
-        from Xlib import X, display
-        d = display.Display(self.dev.env["DISPLAY"])
-        try:
-            return d.screen().root.get_attributes().all_event_masks & X.PropertyChangeMask
-        finally:
-            d.close()
-
     def test_package_and_launch_events_count_only_from_root(self):
         pids = {}
         for app, package in self.APPS.items():
@@ -170,7 +163,8 @@ class ForgedPlatformEventsTest(OpenBusCase):
                 for app in self.APPS:
                     self.send(AUL[0], f"{AUL[1]}.app_launch", f"uint32:{pids[app]}",
                               as_nobody=nobody)
-            wait_for(self.root_watched, message="the daemon to watch the root window")
+            wait_for(lambda: root_watched(self.dev.env["DISPLAY"]),
+                     message="the daemon to watch the root window")
             # back in front, then front: back's period is written, front's has begun.
             self.dev.devsim("app", "focus", back)
             self.dev.devsim("app", "focus", front)
