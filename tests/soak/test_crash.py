@@ -59,6 +59,7 @@ class CrashTest(DeviceTestCase):
         self.snap = os.path.join(self.dev.sysroot, "crashed")
         self.stop = threading.Event()
         self.inserted = 0
+        self.seeded = 0
 
     def inserter(self):
         caller = None
@@ -85,7 +86,13 @@ class CrashTest(DeviceTestCase):
             for day in (3, 2, 1):
                 base = ss.utc_midnight(now, day) * 1000
                 for i in range(60):
-                    ts = base + rnd.randrange(86400000)
+                    # An app-management row is a record of its own, dated to the second: two
+                    # equal rows in one second would be two equal records, which the count of
+                    # hand-overs below would take for one record handed over twice. Every seeded
+                    # row of a day gets a second of its own (7919 is prime to 86400), spread
+                    # over the whole day.
+                    self.seeded += 1
+                    ts = base + (self.seeded * 7919 % 86400) * 1000 + rnd.randrange(1000)
                     con.execute("INSERT INTO use_app_survey(timestamp,app_id,duration) "
                                 "VALUES (?,?,?)", (ts, f"com.app{i % 7}", rnd.randrange(9999)))
                     con.execute("INSERT INTO use_app_feature_survey(timestamp,app_id,feature,"
