@@ -644,15 +644,30 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   std::string lib = root.Path("/usr/lib/libsqlite3.so.0");
   SetDbEncryption(true);
   DbConnection conn;
-  // No key library under the sysroot: the password file is made and the open goes on unkeyed.
+  // A fresh device: the first keyed open makes the password file. The key is the text of
+  // derived bytes, so a key whose first byte is zero (one in 256) leaves an empty file, and
+  // that open fails; whichever key came out, the outcome must match it.
+  int first = conn.Open(db.c_str());
+  struct stat st;
+  ASSERT_EQ(stat(root.Path("/opt/usr/dbspace/.SecurePassword.txt").c_str(), &st), 0);
+  EXPECT_EQ(first, ReadKey().empty() ? -1 : 0);
+  if (first == 0) {
+    EXPECT_EQ(conn.Close(), 0);
+  }
+  // A key with text and no key library under the sysroot: the open goes on unkeyed. A new
+  // process finds the key on file and derives none.
+  ReleaseKeyParams();
+  FILE* file = fopen(root.Path("/opt/usr/dbspace/.SecurePassword.txt").c_str(), "w");
+  ASSERT_NE(file, nullptr);
+  ASSERT_GE(fputs("k3y", file), 0);
+  ASSERT_EQ(fclose(file), 0);
   EXPECT_EQ(conn.Open(db.c_str()), 0);
   {
     DbConnection::SetupScope setup(&conn);
     EXPECT_EQ(conn.Exec("CREATE TABLE t(x);"), 0);
   }
   EXPECT_EQ(conn.Close(), 0);
-  std::string key = ReadKey();
-  EXPECT_FALSE(key.empty());
+  EXPECT_EQ(ReadKey(), "k3y");
   // Debian's library at that path has no sqlite3_key: the open fails.
   ASSERT_EQ(system(("cp -L /usr/lib/x86_64-linux-gnu/libsqlite3.so.0 '" + lib + "'").c_str()), 0);
   EXPECT_EQ(conn.Open(db.c_str()), -1);
