@@ -5,9 +5,12 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <linux/sched.h>
 #include <signal.h>
 #include <sqlite3.h>
 #include <stdlib.h>
+#include <string.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -55,32 +58,44 @@ class AppDbTest : public ::testing::Test {
     return rc;
   }
 
-  // Installs |appId| with a copy of sleep at |exec| (a device path).
+  // Installs |appId| with a copy of sleep at |exec| (a device path); ids are taken verbatim.
   void Install(const std::string& appId, const std::string& package, const std::string& exec) {
     std::string file = sysroot + exec;
     ASSERT_EQ(Sh("mkdir -p \"$(dirname '" + file + "')\" && cp -n /usr/bin/sleep '" + file + "'"),
               0);
-    ASSERT_EQ(AppDb("INSERT INTO package_app_info VALUES ('" + appId + "','" + package + "','" +
-                    exec + "')"),
+    ASSERT_EQ(AppDb("INSERT INTO package_app_info VALUES (" + Quoted(appId) + "," +
+                    Quoted(package) + ",'" + exec + "')"),
               SQLITE_OK);
   }
+  static std::string Quoted(const std::string& text) {
+    std::string out = "'";
+    for (char c : text) out += c == '\'' ? "''" : std::string(1, c);
+    return out + "'";
+  }
 
-  // Starts the executable at device path |exec|; returns once the exec has happened.
-  pid_t Run(const std::string& exec) {
+  // Starts the executable at device path |exec|, as process |pid| if one is given (free, and
+  // ours to choose with CAP_SYS_ADMIN); returns once the exec has happened, or -1.
+  pid_t Run(const std::string& exec, pid_t pid = 0) {
     std::string file = sysroot + exec;
     int fds[2];
     if (pipe2(fds, O_CLOEXEC) != 0) return -1;
-    pid_t pid = fork();
-    if (pid == 0) {
+    struct clone_args args;
+    memset(&args, 0, sizeof(args));
+    args.exit_signal = SIGCHLD;
+    args.set_tid = reinterpret_cast<uintptr_t>(&pid);
+    args.set_tid_size = 1;
+    long child = pid != 0 ? syscall(SYS_clone3, &args, sizeof(args)) : fork();
+    if (child == 0) {
       execl(file.c_str(), file.c_str(), "infinity", static_cast<char*>(nullptr));
       _exit(127);
     }
     close(fds[1]);
     char c;
-    (void)read(fds[0], &c, 1);  // end of file: the exec closed the pipe
+    if (child > 0) (void)read(fds[0], &c, 1);  // end of file: the exec closed the pipe
     close(fds[0]);
-    children.push_back(pid);
-    return pid;
+    if (child <= 0) return -1;
+    children.push_back(static_cast<pid_t>(child));
+    return static_cast<pid_t>(child);
   }
 
   // Rows of |sql| on the survey database, columns joined by ':' and rows ended by ';'.

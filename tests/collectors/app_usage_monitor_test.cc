@@ -2,10 +2,6 @@
 // the clock in the test's hand. Window activations enter behind the X reads.
 #include "collectors/app_usage_monitor.h"
 
-#include <linux/sched.h>
-#include <string.h>
-#include <sys/syscall.h>
-
 #include <algorithm>
 #include <memory>
 
@@ -52,31 +48,6 @@ class AppUsageMonitorTest : public AppDbTest {
     children.erase(std::remove(children.begin(), children.end(), pid), children.end());
   }
 
-  // Runs the executable at device path |exec| as process |pid| (free, and ours to choose
-  // with CAP_SYS_ADMIN); returns the pid, or -1.
-  pid_t RunAt(pid_t pid, const std::string& exec) {
-    std::string file = sysroot + exec;
-    int fds[2];
-    if (pipe2(fds, O_CLOEXEC) != 0) return -1;
-    struct clone_args args;
-    memset(&args, 0, sizeof(args));
-    args.exit_signal = SIGCHLD;
-    args.set_tid = reinterpret_cast<uintptr_t>(&pid);
-    args.set_tid_size = 1;
-    long child = syscall(SYS_clone3, &args, sizeof(args));
-    if (child == 0) {
-      execl(file.c_str(), file.c_str(), "infinity", static_cast<char*>(nullptr));
-      _exit(127);
-    }
-    close(fds[1]);
-    char c;
-    if (child > 0) (void)read(fds[0], &c, 1);  // end of file: the exec closed the pipe
-    close(fds[0]);
-    if (child <= 0) return -1;
-    children.push_back(static_cast<pid_t>(child));
-    return static_cast<pid_t>(child);
-  }
-
   std::unique_ptr<AppUsageMonitor> monitor;
   pid_t alpha = -1, beta = -1, lock = -1;
 };
@@ -103,9 +74,7 @@ TEST_F(AppUsageMonitorTest, APeriodStartsWhereTheLastOneEnded) {
 
 TEST_F(AppUsageMonitorTest, StoresThePackageIdFromTheAppDatabaseVerbatim) {
   const std::string forged = "pkg.o'q',1); DELETE FROM use_app_survey; --";
-  std::string forFixture;  // the fixture's own statement needs the quotes doubled
-  for (char c : forged) forFixture += c == '\'' ? "''" : std::string(1, c);
-  Install("com.ex.quote", forFixture, "/opt/usr/apps/quote/bin/quote");
+  Install("com.ex.quote", forged, "/opt/usr/apps/quote/bin/quote");
   pid_t quote = Run("/opt/usr/apps/quote/bin/quote");
   ActivateAt(kT0, alpha);
   ActivateAt(kT0 + 300, quote);
@@ -208,12 +177,12 @@ TEST_F(AppUsageMonitorTest, APidReusedByAnotherAppIsTheNewApp) {
   Reap(pid);
   g_now = kT0 + 1500;
   EXPECT_EQ(AppUsageMonitor::DeadHandler(pid, monitor.get()), 0);
-  if (RunAt(pid, "/opt/usr/apps/beta/bin/beta") != pid)
+  if (Run("/opt/usr/apps/beta/bin/beta", pid) != pid)
     GTEST_SKIP() << "cannot start a process under a chosen pid here (clone3 set_tid)";
   ActivateAt(kT0 + 2000, pid);
   ActivateAt(kT0 + 2500, lock);
   Reap(pid);  // unannounced this time
-  ASSERT_EQ(RunAt(pid, "/opt/usr/apps/alpha/bin/alpha"), pid);
+  ASSERT_EQ(Run("/opt/usr/apps/alpha/bin/alpha", pid), pid);
   ActivateAt(kT0 + 3000, pid);
   ActivateAt(kT0 + 3700, lock);
   EXPECT_EQ(Periods(), "pkg.alpha:1000;pkg.beta:500;pkg.alpha:700;");

@@ -2,6 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <tuple>
+#include <utility>
+
 namespace daypage {
 namespace {
 
@@ -11,23 +14,23 @@ class DayLayoutTest : public ::testing::Test {
  protected:
   void SetUp() override { ASSERT_TRUE(ParseDate("2026-03-10", &day)); }
   int64_t At(int hour, int minute = 0) const { return day + hour * kHourMs + minute * kMin; }
+  // [start, end] of a span; {-1, -1} for a period not on the day.
+  static std::pair<int64_t, int64_t> P(Span span) { return {span.start, span.end}; }
+  std::pair<int64_t, int64_t> Clip(int64_t start, int64_t end) const {
+    Span out{-1, -1};
+    return ClipToDay({start, end}, day, &out) ? P(out) : P({-1, -1});
+  }
   int64_t day = 0;
 };
 
 TEST_F(DayLayoutTest, ClipsPeriodsToTheDayAcrossMidnight) {
-  Span out{};
-  ASSERT_TRUE(ClipToDay({At(-1), At(1)}, day, &out));  // began yesterday
-  EXPECT_EQ(out.start, day);
-  EXPECT_EQ(out.end, At(1));
-  ASSERT_TRUE(ClipToDay({At(23, 30), At(24, 45)}, day, &out));  // ends tomorrow
-  EXPECT_EQ(out.start, At(23, 30));
-  EXPECT_EQ(out.end, At(24));
-  EXPECT_FALSE(ClipToDay({At(-2), At(0)}, day, &out)) << "ends at midnight: yesterday's";
-  EXPECT_FALSE(ClipToDay({At(24), At(25)}, day, &out));
-  EXPECT_FALSE(ClipToDay({At(5), At(4)}, day, &out)) << "negative length";
-  ASSERT_TRUE(ClipToDay({At(0), At(0)}, day, &out)) << "a point at midnight is today's";
-  EXPECT_EQ(out.end - out.start, 0);
-  EXPECT_FALSE(ClipToDay({At(24), At(24)}, day, &out));
+  EXPECT_EQ(Clip(At(-1), At(1)), P({day, At(1)}));                   // began yesterday
+  EXPECT_EQ(Clip(At(23, 30), At(24, 45)), P({At(23, 30), At(24)}));  // ends tomorrow
+  EXPECT_EQ(Clip(At(-2), At(0)), P({-1, -1})) << "ends at midnight: yesterday's";
+  EXPECT_EQ(Clip(At(24), At(25)), P({-1, -1}));
+  EXPECT_EQ(Clip(At(5), At(4)), P({-1, -1})) << "negative length";
+  EXPECT_EQ(Clip(At(0), At(0)), P({day, day})) << "a point at midnight is today's";
+  EXPECT_EQ(Clip(At(24), At(24)), P({-1, -1}));
 }
 
 TEST_F(DayLayoutTest, OverlappingBarsGetTracksAndCountOnce) {
@@ -35,12 +38,9 @@ TEST_F(DayLayoutTest, OverlappingBarsGetTracksAndCountOnce) {
   // A bar, one overlapping it, one touching its end, a point inside the first two.
   std::vector<Span> spans = {
       {At(1), At(3)}, {At(2), At(4)}, {At(3), At(5)}, {At(2, 30), At(2, 30)}};
-  std::vector<int> track = AssignTracks(spans, &tracks);
+  // Touching ends share a track; the point inside two bars needs a third.
+  EXPECT_EQ(AssignTracks(spans, &tracks), (std::vector<int>{0, 1, 0, 2}));
   EXPECT_EQ(tracks, 3);
-  EXPECT_EQ(track[0], 0);
-  EXPECT_EQ(track[1], 1);
-  EXPECT_EQ(track[2], 0) << "touching ends share a track";
-  EXPECT_EQ(track[3], 2) << "a point inside two bars";
   AssignTracks({}, &tracks);
   EXPECT_EQ(tracks, 1);
 
@@ -50,18 +50,11 @@ TEST_F(DayLayoutTest, OverlappingBarsGetTracksAndCountOnce) {
 }
 
 TEST_F(DayLayoutTest, WindowCoversWholeHoursAroundWhatIsDrawn) {
-  Span all = ViewWindow({}, day);
-  EXPECT_EQ(all.start, day);
-  EXPECT_EQ(all.end, At(24));
-  Span evening = ViewWindow({{At(21, 58), At(22, 10)}, {At(23, 1), At(23, 1)}}, day);
-  EXPECT_EQ(evening.start, At(21));
-  EXPECT_EQ(evening.end, At(24));
-  Span point = ViewWindow({{At(7), At(7)}}, day);  // at least an hour
-  EXPECT_EQ(point.start, At(7));
-  EXPECT_EQ(point.end, At(8));
-  Span late = ViewWindow({{At(24), At(24)}}, day);  // never past midnight
-  EXPECT_EQ(late.start, At(23));
-  EXPECT_EQ(late.end, At(24));
+  EXPECT_EQ(P(ViewWindow({}, day)), P({day, At(24)}));
+  EXPECT_EQ(P(ViewWindow({{At(21, 58), At(22, 10)}, {At(23, 1), At(23, 1)}}, day)),
+            P({At(21), At(24)}));
+  EXPECT_EQ(P(ViewWindow({{At(7), At(7)}}, day)), P({At(7), At(8)}));      // at least an hour
+  EXPECT_EQ(P(ViewWindow({{At(24), At(24)}}, day)), P({At(23), At(24)}));  // never past midnight
 }
 
 TEST_F(DayLayoutTest, PlacesBarsProportionallyAndKeepsPointsVisible) {
@@ -98,14 +91,15 @@ TEST_F(DayLayoutTest, DatesClocksAndDurations) {
   EXPECT_EQ(FormatDuration(2 * kHourMs + 5 * kMin), "2 h 05 min 00 s");
 
   // Sliced records are dated by their window's end; the last slice closes the day before.
-  EXPECT_TRUE(RecordDay("001", "2026-03-11T00:00:00+0900", &other));
-  EXPECT_EQ(other, day);
-  EXPECT_TRUE(RecordDay("002", "2026-03-10T03:00:00+0900", &other));
-  EXPECT_EQ(other, day);
-  EXPECT_TRUE(RecordDay("007", "2026-03-10T00:00:00+0900", &other));
-  EXPECT_EQ(other, day);
-  EXPECT_TRUE(RecordDay("003", "2026-03-11T00:00:00+0900", &other));
-  EXPECT_EQ(other, day + kDayMs);
+  for (auto [activity, date, expected] :
+       {std::make_tuple("001", "2026-03-11T00:00:00+0900", day),
+        std::make_tuple("002", "2026-03-10T03:00:00+0900", day),
+        std::make_tuple("007", "2026-03-10T00:00:00+0900", day),
+        std::make_tuple("003", "2026-03-11T00:00:00+0900", day + kDayMs)}) {
+    other = -1;
+    EXPECT_TRUE(RecordDay(activity, date, &other)) << activity;
+    EXPECT_EQ(other, expected) << activity;
+  }
   EXPECT_FALSE(RecordDay("001", "2026-03-11 00:00", &other));
 }
 

@@ -11,6 +11,7 @@
 
 #include <string>
 
+#include "tests/sqlite_rows.h"
 #include "tests/temp_sysroot.h"
 
 namespace {
@@ -114,17 +115,8 @@ TEST_F(AppDbTest, AnswersFollowTheFileReplacedOrWrittenInPlace) {
   ASSERT_EQ(Exec(writer, "UPDATE package_app_info SET package = 'pkg.third'"), SQLITE_OK);
   EXPECT_EQ(Self(), "com.ex.second/pkg.third");
   // In place through a WAL log: with the writer still open, the main file stays as it was.
-  char* mode = nullptr;
-  ASSERT_EQ(sqlite3_exec(
-                writer, "PRAGMA journal_mode=WAL",
-                [](void* out, int, char** values, char**) {
-                  *static_cast<char**>(out) = sqlite3_mprintf("%s", values[0]);
-                  return 0;
-                },
-                &mode, nullptr),
-            SQLITE_OK);
-  ASSERT_STREQ(mode, "wal");
-  sqlite3_free(mode);
+  ASSERT_EQ(Exec(writer, "PRAGMA journal_mode=WAL"), SQLITE_OK);
+  ASSERT_EQ(FileRows(db, "PRAGMA journal_mode"), "wal;");
   EXPECT_EQ(Self(), "com.ex.second/pkg.third");
   ASSERT_EQ(Exec(writer, "UPDATE package_app_info SET package = 'pkg.fourth'"), SQLITE_OK);
   EXPECT_EQ(Self(), "com.ex.second/pkg.fourth");
@@ -158,18 +150,10 @@ TEST_F(AppDbTest, ExecutableLookupsAgreeWithAndWithoutTheIndex) {
     // A second app of the same executable, installed later: it comes second.
     sql += "INSERT INTO package_app_info VALUES ('a.also', 'pkg.self', '" + self + "'); COMMIT;";
     ASSERT_EQ(Exec(conn, sql), SQLITE_OK);
-    std::string plan;
-    ASSERT_EQ(sqlite3_exec(
-                  conn,
-                  "EXPLAIN QUERY PLAN SELECT app_id, package, app_exec FROM package_app_info "
-                  "WHERE app_exec = 'x' ORDER BY rowid",
-                  [](void* out, int columns, char** values, char**) {
-                    *static_cast<std::string*>(out) += values[columns - 1];
-                    return 0;
-                  },
-                  &plan, nullptr),
-              SQLITE_OK);
     sqlite3_close(conn);
+    std::string plan = FileRows(file,
+                                "EXPLAIN QUERY PLAN SELECT app_id, package, app_exec FROM "
+                                "package_app_info WHERE app_exec = 'x' ORDER BY rowid");
     EXPECT_EQ(plan.find("USING INDEX package_app_info_exec") != std::string::npos, index) << plan;
 
     EXPECT_EQ(Self(), "z.self/pkg.self");

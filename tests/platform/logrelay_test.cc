@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <fstream>
+#include <functional>
 #include <sstream>
 #include <string>
 
@@ -41,36 +42,29 @@ TEST_F(LogRelayTest, RefusesLinksAndOddFilesWithoutTouchingTheirTargets) {
   const std::string target = tmp_.path() + "/target";
   std::ofstream(target) << "keep\n";
   ASSERT_EQ(system(("mkdir -p '" + dir_ + "'").c_str()), 0);
-  {
-    SCOPED_TRACE("outbox is a link to another file");
-    ASSERT_EQ(symlink(target.c_str(), outbox_.c_str()), 0);
+  const std::string elsewhere = tmp_.path() + "/elsewhere";
+  ASSERT_EQ(mkdir(elsewhere.c_str(), 0700), 0);
+  // Each way puts something in the outbox's place; the FIFO nobody reads is refused at once,
+  // not waited on.
+  const struct {
+    const char* what;
+    std::function<int()> make;
+    std::string made;
+  } ways[] = {
+      {"link to another file", [&] { return symlink(target.c_str(), outbox_.c_str()); }, outbox_},
+      {"hard link to another file", [&] { return link(target.c_str(), outbox_.c_str()); }, outbox_},
+      {"FIFO", [&] { return mkfifo(outbox_.c_str(), 0600); }, outbox_},
+      {"directory is a link",
+       [&] { return rmdir(dir_.c_str()) || symlink(elsewhere.c_str(), dir_.c_str()); }, dir_},
+  };
+  for (const auto& way : ways) {
+    SCOPED_TRACE(way.what);
+    ASSERT_EQ(way.make(), 0);
     EXPECT_EQ(RegisterOne(), CORVANE_LOG_RELAY_ERROR_IO);
     EXPECT_EQ(Read(target), "keep\n");
-    ASSERT_EQ(unlink(outbox_.c_str()), 0);
-  }
-  {
-    SCOPED_TRACE("outbox is a hard link to another file");
-    ASSERT_EQ(link(target.c_str(), outbox_.c_str()), 0);
-    EXPECT_EQ(RegisterOne(), CORVANE_LOG_RELAY_ERROR_IO);
-    EXPECT_EQ(Read(target), "keep\n");
-    ASSERT_EQ(unlink(outbox_.c_str()), 0);
-  }
-  {
-    SCOPED_TRACE("outbox is a FIFO nobody reads: refused at once, not waited on");
-    ASSERT_EQ(mkfifo(outbox_.c_str(), 0600), 0);
-    EXPECT_EQ(RegisterOne(), CORVANE_LOG_RELAY_ERROR_IO);
-    ASSERT_EQ(unlink(outbox_.c_str()), 0);
-  }
-  {
-    SCOPED_TRACE("the outbox directory is a link");
-    const std::string elsewhere = tmp_.path() + "/elsewhere";
-    ASSERT_EQ(mkdir(elsewhere.c_str(), 0700), 0);
-    ASSERT_EQ(rmdir(dir_.c_str()), 0);
-    ASSERT_EQ(symlink(elsewhere.c_str(), dir_.c_str()), 0);
-    EXPECT_EQ(RegisterOne(), CORVANE_LOG_RELAY_ERROR_IO);
     struct stat st;
     EXPECT_NE(stat((elsewhere + "/outbox.jsonl").c_str(), &st), 0);
-    ASSERT_EQ(unlink(dir_.c_str()), 0);
+    ASSERT_EQ(unlink(way.made.c_str()), 0);
   }
   // Control: with nothing in the way the record lands in a directory and file of our own.
   EXPECT_EQ(RegisterOne(), CORVANE_LOG_RELAY_ERROR_NONE);

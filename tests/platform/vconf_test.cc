@@ -10,6 +10,7 @@
 
 #include <fstream>
 #include <string>
+#include <utility>
 
 #include "platform/host/vconf_store.h"
 #include "tests/temp_sysroot.h"
@@ -28,34 +29,19 @@ class VconfTest : public ::testing::Test {
 };
 
 TEST_F(VconfTest, ParsesOnlyWellFormedLines) {
-  struct Case {
-    const char* text;
-    bool ok;
-    int type;
-  } cases[] = {
-      {"bool 1\n", true, VCONF_TYPE_BOOL},
-      {"bool 0", true, VCONF_TYPE_BOOL},
-      {"int -42\n", true, VCONF_TYPE_INT},
-      {"double 2.5\n", true, VCONF_TYPE_DOUBLE},
-      {"string a b c\n", true, VCONF_TYPE_STRING},
-      {"string \n", true, VCONF_TYPE_STRING},
-      {"bool 2\n", false, 0},
-      {"int 12x\n", false, 0},
-      {"int 99999999999\n", false, 0},
-      {"int  5\n", false, 0},
-      {"double nope\n", false, 0},
-      {"float 1\n", false, 0},
-      {"int\n", false, 0},
-      {"", false, 0},
-      {"string a\nstring b\n", false, 0},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.text);
+  const std::pair<const char*, int> good[] = {
+      {"bool 1\n", VCONF_TYPE_BOOL},         {"bool 0", VCONF_TYPE_BOOL},
+      {"int -42\n", VCONF_TYPE_INT},         {"double 2.5\n", VCONF_TYPE_DOUBLE},
+      {"string a b c\n", VCONF_TYPE_STRING}, {"string \n", VCONF_TYPE_STRING}};
+  for (auto [text, type] : good) {
     vconf_store::Value v;
-    ASSERT_EQ(vconf_store::Parse(c.text, strlen(c.text), &v), c.ok);
-    if (c.ok) {
-      EXPECT_EQ(v.type, c.type);
-    }
+    ASSERT_TRUE(vconf_store::Parse(text, strlen(text), &v)) << text;
+    EXPECT_EQ(v.type, type) << text;
+  }
+  for (const char* bad : {"bool 2\n", "int 12x\n", "int 99999999999\n", "int  5\n", "double nope\n",
+                          "float 1\n", "int\n", "", "string a\nstring b\n"}) {
+    vconf_store::Value v;
+    EXPECT_FALSE(vconf_store::Parse(bad, strlen(bad), &v)) << bad;
   }
 }
 

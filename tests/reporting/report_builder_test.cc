@@ -7,6 +7,7 @@
 #include <memory>
 
 #include "tests/reporting/reporting_test_env.h"
+#include "tests/sqlite_rows.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -16,9 +17,12 @@ const std::string kHead = "mcc=¶mnc=¶did=¶model=Gear-X1¶fw_ver=W2.3-K9¶";
 
 class ReportBuilderTest : public ReportingTest {
  protected:
+  // Most tests run on June 12th with the 10th reported: the 11th is due.
   void SetUp() override {
     ReportingTest::SetUp();
     builder = std::make_unique<ReportBuilder>(Context());
+    Now(2024, 6, 12, 10);
+    SentDate(2024, 6, 10);
   }
 
   void Now(int year, int month, int day, int hour) {
@@ -27,10 +31,24 @@ class ReportBuilderTest : public ReportingTest {
   void SentDate(int year, int month, int day) {
     ASSERT_EQ(prefs.SetSentDate(static_cast<int32_t>(LocalMs(year, month, day) / 1000)), 0);
   }
+  int64_t Sent() { return static_cast<int64_t>(prefs.GetSentDate()) * 1000; }
   void Row(const std::string& table, const std::string& columns, int64_t stamp,
            const std::string& values) {
     Exec(survey, "INSERT INTO " + table + "(timestamp," + columns + ") VALUES (" +
                      std::to_string(stamp) + "," + values + ");");
+  }
+  void Use(int64_t stamp, const std::string& values) {
+    Row("use_app_survey", "app_id,duration", stamp, values);
+  }
+  void Feature(int64_t stamp, const std::string& values) {
+    Row("use_app_feature_survey", "app_id,feature,extra,value", stamp, values);
+  }
+  void Manage(int64_t stamp, const std::string& values) {
+    Row("manage_app_survey", "installed_app_id,type", stamp, values);
+  }
+  std::string Count(DbConnection* conn, const std::string& table) {
+    std::vector<std::string> rows = Column(conn, "SELECT count(*) FROM " + table);
+    return rows.empty() ? "<error>" : rows[0];
   }
   std::vector<std::string> Bodies(const std::string& activity) {
     return Column(upload,
@@ -41,23 +59,19 @@ class ReportBuilderTest : public ReportingTest {
 };
 
 TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
-  Now(2024, 6, 12, 10);
-  SentDate(2024, 6, 10);
-  const std::string useApp = "use_app_survey", feature = "use_app_feature_survey";
-  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 1), "'a.calc',1000");
-  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 2, 30), "'a.calc',500");
-  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 2), "'b.mail',200");
-  Row(useApp, "app_id,duration", LocalMs(2024, 6, 11, 22), "'a.calc',300");
-  Row(useApp, "app_id,duration", LocalMs(2024, 6, 10, 22), "'old.day',1");        // purged unsent
-  Row(useApp, "app_id,duration", LocalMs(2024, 6, 12, 0, 0, 0, 1), "'today',1");  // kept
-  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 11, 10, 15, 30), "'c.game',1");
+  Use(LocalMs(2024, 6, 11, 1), "'a.calc',1000");
+  Use(LocalMs(2024, 6, 11, 2, 30), "'a.calc',500");
+  Use(LocalMs(2024, 6, 11, 2), "'b.mail',200");
+  Use(LocalMs(2024, 6, 11, 22), "'a.calc',300");
+  Use(LocalMs(2024, 6, 10, 22), "'old.day',1");        // purged unsent
+  Use(LocalMs(2024, 6, 12, 0, 0, 0, 1), "'today',1");  // kept
+  Manage(LocalMs(2024, 6, 11, 10, 15, 30), "'c.game',1");
   Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 8), "'a.calc',2");
   Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 9), "'a.calc',2");
   Row("report_app_error_survey", "app_id,type", LocalMs(2024, 6, 11, 12), "'b.mail',1");
-  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 13), "'lm','SCRN','',4000");
-  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 14, 59, 59),
-      "'lm','SCRN','',1000");
-  Row(feature, "app_id,feature,extra,value", LocalMs(2024, 6, 11, 15), "'lm','WIFI','',10");
+  Feature(LocalMs(2024, 6, 11, 13), "'lm','SCRN','',4000");
+  Feature(LocalMs(2024, 6, 11, 14, 59, 59), "'lm','SCRN','',1000");
+  Feature(LocalMs(2024, 6, 11, 15), "'lm','WIFI','',10");
 
   ASSERT_EQ(builder->RunDaily(), 0);
 
@@ -99,23 +113,20 @@ TEST_F(ReportBuilderTest, OneDayInSlicesGivesExactRecordsAndPurgesTheDay) {
   // The day and everything before it is gone; today's row waits.
   for (const char* table : {"use_app_survey", "manage_app_survey", "report_app_error_survey",
                             "use_app_feature_survey"}) {
-    SCOPED_TRACE(table);
-    EXPECT_EQ(Column(survey, std::string("SELECT count(*) FROM ") + table),
-              std::vector<std::string>{table == useApp ? "1" : "0"});
+    EXPECT_EQ(Count(survey, table), std::string(table) == "use_app_survey" ? "1" : "0") << table;
   }
-  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
+  EXPECT_EQ(Sent(), LocalMs(2024, 6, 11));
 
   // Nothing is due any more: a second run writes nothing.
   ASSERT_EQ(builder->RunDaily(), 0);
-  EXPECT_EQ(Column(upload, "SELECT count(*) FROM survey_log"), std::vector<std::string>{"9"});
+  EXPECT_EQ(Count(upload, "survey_log"), "9");
 }
 
 TEST_F(ReportBuilderTest, ManageRowInTheLastSecondIsDroppedUnreportedByTheNextDay) {
   Now(2024, 6, 10, 10);
   SentDate(2024, 6, 8);
-  Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 9, 23, 59, 59, 500),
-      "'m.late',0");
-  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 9, 23, 59, 59, 500), "'u.late',7");
+  Manage(LocalMs(2024, 6, 9, 23, 59, 59, 500), "'m.late',0");
+  Use(LocalMs(2024, 6, 9, 23, 59, 59, 500), "'u.late',7");
 
   ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_TRUE(Bodies("003").empty());
@@ -128,19 +139,15 @@ TEST_F(ReportBuilderTest, ManageRowInTheLastSecondIsDroppedUnreportedByTheNextDa
   Now(2024, 6, 11, 10);
   ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_TRUE(Bodies("003").empty());
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"),
-            std::vector<std::string>{"0"});
+  EXPECT_EQ(Count(survey, "manage_app_survey"), "0");
 }
 
 TEST_F(ReportBuilderTest, QuotesAndCommasFromOutsideCallersStayInTheirOwnRecord) {
-  Now(2024, 6, 12, 10);
-  SentDate(2024, 6, 10);
   WriteFile("/sys/class/dmi/id/product_name", "Gear, Rev 'B'\n");
-  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'it''s',5");
-  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'x,y',700");
-  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'z.ok',9");
-  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 5),
-      "'lm','CAPT','a''b',1");
+  Use(LocalMs(2024, 6, 11, 1), "'it''s',5");
+  Use(LocalMs(2024, 6, 11, 1), "'x,y',700");
+  Use(LocalMs(2024, 6, 11, 1), "'z.ok',9");
+  Feature(LocalMs(2024, 6, 11, 5), "'lm','CAPT','a''b',1");
 
   ASSERT_EQ(builder->RunDaily(), 0);
 
@@ -160,20 +167,16 @@ TEST_F(ReportBuilderTest, QuotesAndCommasFromOutsideCallersStayInTheirOwnRecord)
 }
 
 TEST_F(ReportBuilderTest, SumsPastTheIntegerLimitSaturateAndCostNoOtherRecord) {
-  Now(2024, 6, 12, 10);
-  SentDate(2024, 6, 10);
-  const std::string feature = "use_app_feature_survey";
   const int64_t t = LocalMs(2024, 6, 11, 1);
   // Eighteen digits: each value still renders whole; ten of them pass 2^63.
-  for (int i = 0; i < 10; ++i)
-    Row("use_app_survey", "app_id,duration", t, "'big',999999999999999999");
-  Row("use_app_survey", "app_id,duration", t, "'a.calc',1000");
-  Row("use_app_survey", "app_id,duration", t, "'a.calc',500");
-  Row(feature, "app_id,feature,extra,value", t, "'x','HALF','',1.5");
-  Row(feature, "app_id,feature,extra,value", t, "'x','HALF','',1");
-  Row(feature, "app_id,feature,extra,value", t, "'x','NONE','',NULL");
-  Row(feature, "app_id,feature,extra,value", t, "'x','NEG','',-7");
-  Row(feature, "app_id,feature,extra,value", t, "'lm','SCRN','',4000");
+  for (int i = 0; i < 10; ++i) Use(t, "'big',999999999999999999");
+  Use(t, "'a.calc',1000");
+  Use(t, "'a.calc',500");
+  Feature(t, "'x','HALF','',1.5");
+  Feature(t, "'x','HALF','',1");
+  Feature(t, "'x','NONE','',NULL");
+  Feature(t, "'x','NEG','',-7");
+  Feature(t, "'lm','SCRN','',4000");
 
   ASSERT_EQ(builder->RunDaily(), 0);
 
@@ -189,15 +192,12 @@ TEST_F(ReportBuilderTest, SumsPastTheIntegerLimitSaturateAndCostNoOtherRecord) {
                                kHead + date + "count=1¶app_id=x¶feature=NEG¶extra=¶value=-7",
                                kHead + date + "count=¶app_id=x¶feature=NONE¶extra=¶value="}));
   EXPECT_EQ(Bodies("007").size(), 1u);
-  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 11) / 1000);
+  EXPECT_EQ(Sent(), LocalMs(2024, 6, 11));
 }
 
 TEST_F(ReportBuilderTest, ATableWhoseSelectFailsKeepsItsRowsAndTheDayStaysDue) {
-  Now(2024, 6, 12, 10);
-  SentDate(2024, 6, 10);
-  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'a.calc',1000");
-  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 1),
-      "'lm','SCRN','',4000");
+  Use(LocalMs(2024, 6, 11, 1), "'a.calc',1000");
+  Feature(LocalMs(2024, 6, 11, 1), "'lm','SCRN','',4000");
   // Another connection changes the schema under the daemon's, so the feature select fails.
   auto alter = [&](const char* sql) {
     sqlite3* other = nullptr;
@@ -209,18 +209,16 @@ TEST_F(ReportBuilderTest, ATableWhoseSelectFailsKeepsItsRowsAndTheDayStaysDue) {
   alter("ALTER TABLE use_app_feature_survey RENAME COLUMN extra TO gone");
 
   EXPECT_EQ(builder->RunDaily(), -1);
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_feature_survey"),
-            std::vector<std::string>{"1"});
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_survey"), std::vector<std::string>{"0"});
-  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 10) / 1000);
+  EXPECT_EQ(Count(survey, "use_app_feature_survey"), "1");
+  EXPECT_EQ(Count(survey, "use_app_survey"), "0");
+  EXPECT_EQ(Sent(), LocalMs(2024, 6, 10));
 
   // The repeat completes the day; the purged table's record is not queued again.
   alter("ALTER TABLE use_app_feature_survey RENAME COLUMN gone TO extra");
   ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_EQ(Bodies("001").size(), 1u);
   EXPECT_EQ(Bodies("002").size(), 1u);
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_feature_survey"),
-            std::vector<std::string>{"0"});
+  EXPECT_EQ(Count(survey, "use_app_feature_survey"), "0");
 }
 
 // A table's records are queued in one transaction, committed before its rows are purged. A
@@ -228,13 +226,10 @@ TEST_F(ReportBuilderTest, ATableWhoseSelectFailsKeepsItsRowsAndTheDayStaysDue) {
 // none of the table's records visible and its rows still there; the next run rolls it back and
 // queues every record once: none lost, none twice.
 TEST_F(ReportBuilderTest, AWorkerStoppedInsideATablesRecordsLeavesThemToTheNextRunOnce) {
-  Now(2024, 6, 12, 10);
-  SentDate(2024, 6, 10);
-  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 1), "'a.calc',1000");
-  Row("use_app_survey", "app_id,duration", LocalMs(2024, 6, 11, 13), "'b.mail',20");
+  Use(LocalMs(2024, 6, 11, 1), "'a.calc',1000");
+  Use(LocalMs(2024, 6, 11, 13), "'b.mail',20");
   for (int i = 0; i < 5; ++i) {
-    Row("manage_app_survey", "installed_app_id,type", LocalMs(2024, 6, 11, 10 + i),
-        "'pkg" + std::to_string(i) + "',1");
+    Manage(LocalMs(2024, 6, 11, 10 + i), "'pkg" + std::to_string(i) + "',1");
   }
   // Holds the worker inside the insert of the queue's fourth record (manage's second) until
   // the stop has been asked.
@@ -269,21 +264,13 @@ TEST_F(ReportBuilderTest, AWorkerStoppedInsideATablesRecordsLeavesThemToTheNextR
   EXPECT_FALSE(stopped.returned) << "the stop ends the worker";
 
   EXPECT_TRUE(upload->InTransaction());
-  sqlite3* reader = nullptr;  // what another connection (and a crash) sees: the commits only
-  ASSERT_EQ(sqlite3_open((sysroot + "/opt/usr/dbspace/.ServerUploaderDB.db").c_str(), &reader),
-            SQLITE_OK);
-  sqlite3_stmt* count = nullptr;
-  ASSERT_EQ(sqlite3_prepare_v2(reader, "SELECT group_concat(activity) FROM survey_log", -1, &count,
-                               nullptr),
-            SQLITE_OK);
-  ASSERT_EQ(sqlite3_step(count), SQLITE_ROW);
-  EXPECT_STREQ(reinterpret_cast<const char*>(sqlite3_column_text(count, 0)), "001,001");
-  sqlite3_finalize(count);
-  sqlite3_close(reader);
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM use_app_survey"), std::vector<std::string>{"0"});
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"),
-            std::vector<std::string>{"5"});
-  EXPECT_EQ(static_cast<int64_t>(prefs.GetSentDate()), LocalMs(2024, 6, 10) / 1000);
+  // What another connection (and a crash) sees: the commits only.
+  EXPECT_EQ(FileRows(sysroot + "/opt/usr/dbspace/.ServerUploaderDB.db",
+                     "SELECT group_concat(activity) FROM survey_log"),
+            "001,001;");
+  EXPECT_EQ(Count(survey, "use_app_survey"), "0");
+  EXPECT_EQ(Count(survey, "manage_app_survey"), "5");
+  EXPECT_EQ(Sent(), LocalMs(2024, 6, 10));
 
   ASSERT_EQ(builder->RunDaily(), 0);
   EXPECT_FALSE(upload->InTransaction());
@@ -294,22 +281,17 @@ TEST_F(ReportBuilderTest, AWorkerStoppedInsideATablesRecordsLeavesThemToTheNextR
     EXPECT_NE(manage[i].find("app_id=pkg" + std::to_string(i) + "¶"), std::string::npos);
   }
   EXPECT_EQ(Bodies("007").size(), 1u);
-  EXPECT_EQ(Column(survey, "SELECT count(*) FROM manage_app_survey"),
-            std::vector<std::string>{"0"});
+  EXPECT_EQ(Count(survey, "manage_app_survey"), "0");
 }
 
 TEST_F(ReportBuilderTest, LongBodiesAreStoredWholeOrCutAtACharacterAndTalliedInFull) {
-  Now(2024, 6, 12, 10);
-  SentDate(2024, 6, 10);
   const std::string longFeature(290, 'f'), longExtra(290, 'e'), marks = [] {
     std::string text;
     for (int i = 0; i < 149; ++i) text += "¶";  // two bytes each
     return text;
   }();
-  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 1),
-      "'lm','" + longFeature + "','" + longExtra + "',1");
-  Row("use_app_feature_survey", "app_id,feature,extra,value", LocalMs(2024, 6, 11, 4),
-      "'" + longExtra + "','" + longFeature + "','" + marks + "',2");
+  Feature(LocalMs(2024, 6, 11, 1), "'lm','" + longFeature + "','" + longExtra + "',1");
+  Feature(LocalMs(2024, 6, 11, 4), "'" + longExtra + "','" + longFeature + "','" + marks + "',2");
 
   ASSERT_EQ(builder->RunDaily(), 0);
 

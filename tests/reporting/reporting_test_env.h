@@ -10,7 +10,6 @@
 #include <time.h>
 
 #include <fstream>
-#include <sstream>
 #include <string>
 #include <vector>
 
@@ -61,15 +60,9 @@ class ReportingTest : public ProviderTest {
   void WriteFile(const std::string& fixedPath, const std::string& text) {
     ASSERT_TRUE(root->Write(fixedPath, text)) << fixedPath;
   }
-  std::string ReadFile(const std::string& fixedPath) {
-    std::ifstream in(sysroot + fixedPath, std::ios::binary);
-    std::stringstream text;
-    text << in.rdbuf();
-    return text.str();
-  }
   std::vector<std::string> OutboxLines() {
     std::vector<std::string> lines;
-    std::istringstream in(ReadFile("/opt/usr/data/log-relay/outbox.jsonl"));
+    std::ifstream in(sysroot + "/opt/usr/data/log-relay/outbox.jsonl");
     for (std::string line; std::getline(in, line);) lines.push_back(line);
     return lines;
   }
