@@ -26,9 +26,7 @@ class AppUsageMonitorTest : public AppDbTest {
     alpha = Run("/opt/usr/apps/alpha/bin/alpha");
     beta = Run("/opt/usr/apps/beta/bin/beta");
     lock = Run("/opt/usr/apps/lock/bin/lock");
-    ASSERT_GT(alpha, 0);
-    ASSERT_GT(beta, 0);
-    ASSERT_GT(lock, 0);
+    ASSERT_TRUE(alpha > 0 && beta > 0 && lock > 0);
     monitor.reset(new AppUsageMonitor(ProviderRegistry::GetInstance(), FakeNow));
   }
   void TearDown() override {

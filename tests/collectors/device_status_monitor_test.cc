@@ -3,7 +3,6 @@
 
 #include <gtest/gtest.h>
 #include <sqlite3.h>
-#include <stdlib.h>
 
 #include <string>
 
@@ -20,7 +19,6 @@ namespace {
 class DeviceStatusMonitorTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    ASSERT_EQ(system(("mkdir -p '" + sysroot + "/opt/usr/dbspace'").c_str()), 0);
     ASSERT_EQ(prefs.Create(), 0);
     ASSERT_EQ(ProviderRegistry::GetInstance()->CreateProviders(), 0);
     ASSERT_EQ(DbManager::GetInstance()->Init(), 0);
@@ -49,7 +47,7 @@ class DeviceStatusMonitorTest : public ::testing::Test {
   }
 
   static constexpr const char* kAppId = "com.ex.logger";
-  TempSysroot tmp{"device"};
+  TempSysroot tmp{"device", {"/opt/usr/dbspace"}};
   const std::string sysroot = tmp.path();
   PrefStore prefs;
   DeviceStatusMonitor monitor{ProviderRegistry::GetInstance(), &prefs, WallClockMs};

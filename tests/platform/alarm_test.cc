@@ -36,25 +36,20 @@ gboolean GiveUp(gpointer loop) {
   return G_SOURCE_REMOVE;
 }
 
-alarm_entry_t* RepeatingEntryAt(time_t when, int interval) {
-  struct tm tm;
-  localtime_r(&when, &tm);
-  alarm_entry_t* entry = alarmmgr_create_alarm();
-  alarm_date_t date = {tm.tm_year + 1900, tm.tm_mon + 1, tm.tm_mday,
-                       tm.tm_hour,        tm.tm_min,     tm.tm_sec};
-  EXPECT_EQ(alarmmgr_set_time(entry, date), 0);
-  EXPECT_EQ(alarmmgr_set_repeat_mode(entry, ALARM_REPEAT_MODE_REPEAT, interval), 0);
-  EXPECT_EQ(alarmmgr_set_type(entry, ALARM_TYPE_VOLATILE), 0);
-  return entry;
-}
-
 TEST(AlarmTest, RepeatsAtItsIntervalAndStopsWhenRemoved) {
   Fired fired;
   fired.loop = g_main_loop_new(nullptr, FALSE);
   fired.quit_after = 2;
   alarm_id_t id = 0;
   time_t target = Now() + 1;
-  alarm_entry_t* entry = RepeatingEntryAt(target, 1);
+  struct tm tm;
+  localtime_r(&target, &tm);
+  alarm_entry_t* entry = alarmmgr_create_alarm();
+  alarm_date_t date = {tm.tm_year + 1900, tm.tm_mon + 1, tm.tm_mday,
+                       tm.tm_hour,        tm.tm_min,     tm.tm_sec};
+  ASSERT_EQ(alarmmgr_set_time(entry, date), 0);
+  ASSERT_EQ(alarmmgr_set_repeat_mode(entry, ALARM_REPEAT_MODE_REPEAT, 1), 0);
+  ASSERT_EQ(alarmmgr_set_type(entry, ALARM_TYPE_VOLATILE), 0);
   EXPECT_NE(alarmmgr_add_alarm_with_localtime(entry, nullptr, &id), 0);  // not initialised
 
   ASSERT_EQ(alarmmgr_init("com.corvane.test"), 0);
