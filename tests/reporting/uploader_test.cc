@@ -5,32 +5,10 @@
 
 #include <memory>
 
-#include "reporting/row_splitter.h"
 #include "tests/reporting/reporting_test_env.h"
 
 namespace _CorvaneLogManager {
 namespace {
-
-TEST(RowSplitterTest, YieldsEmptyTokensAndNeverNull) {
-  char row[] = "7,,x y,";
-  char* cursor = nullptr;
-  std::vector<std::string> tokens;
-  tokens.push_back(RowSplitter::Next(row, ",", &cursor));
-  for (int i = 0; i < 4; ++i) tokens.push_back(RowSplitter::Next(nullptr, ",", &cursor));
-  EXPECT_EQ(tokens, (std::vector<std::string>{"7", "", "x y", "", ""}));
-
-  char a[] = "1,2,3,4,5,6,7,8,9,", b[] = "1,2,";  // a short row pads with empty fields
-  char* rows[] = {a, b};
-  char** fields = RowSplitter::SplitRows(rows, 2, Uploader::kRecordFields);
-  ASSERT_NE(fields, nullptr);
-  EXPECT_STREQ(fields[8], "9");
-  EXPECT_STREQ(fields[9], "1");
-  EXPECT_STREQ(fields[10], "2");
-  EXPECT_STREQ(fields[17], "");
-  EXPECT_EQ(fields[0], a);  // cut in place
-  delete[] fields;
-  EXPECT_EQ(RowSplitter::SplitRows(rows, 0, Uploader::kRecordFields), nullptr);
-}
 
 class UploaderTest : public ReportingTest {
  protected:
