@@ -114,7 +114,14 @@ TEST_F(ReportSchedulerTest, ADueCheckRunsTheMissedDaysAfterTheWeeklyStatusCopy) 
   EXPECT_EQ(prefs.GetDeleteDate(), g_testNowMs) << "never purged: the run purges";
 }
 
-TEST_F(ReportSchedulerTest, ATimeChangeClampsForcedAndCatchesUp) {
+TEST_F(ReportSchedulerTest, ATimeChangeClampsForcedAndForcesThePurge) {
+  ASSERT_EQ(prefs.SetDeleteDate(g_testNowMs - 1000), 0);
+  SetSent(DaysAgo(-8));
+  scheduler.HandleEvent(ReportScheduler::kTimeChanged);
+  EXPECT_EQ(Sent(), DaysAgo(1));
+  EXPECT_FALSE(RunStarted());
+  EXPECT_EQ(prefs.GetDeleteDate(), 0);
+
   // Five days behind: the days before the last three are given up. A report date in the
   // future is only reset, without a status copy.
   SetSent(DaysAgo(6));
