@@ -30,4 +30,11 @@ inline std::string FileRows(const std::string& path, const std::string& sql, con
   return out;
 }
 
+// |text| as an SQL string literal, its quotes doubled: a fixture's own statement takes any text.
+inline std::string SqlQuoted(const std::string& text) {
+  std::string out = "'";
+  for (char c : text) out += c == '\'' ? "''" : std::string(1, c);
+  return out + "'";
+}
+
 #endif  // LOGMGR_TESTS_SQLITE_ROWS_H_

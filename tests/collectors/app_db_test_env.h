@@ -63,14 +63,9 @@ class AppDbTest : public ::testing::Test {
     std::string file = sysroot + exec;
     ASSERT_EQ(Sh("mkdir -p \"$(dirname '" + file + "')\" && cp -n /usr/bin/sleep '" + file + "'"),
               0);
-    ASSERT_EQ(AppDb("INSERT INTO package_app_info VALUES (" + Quoted(appId) + "," +
-                    Quoted(package) + ",'" + exec + "')"),
+    ASSERT_EQ(AppDb("INSERT INTO package_app_info VALUES (" + SqlQuoted(appId) + "," +
+                    SqlQuoted(package) + ",'" + exec + "')"),
               SQLITE_OK);
-  }
-  static std::string Quoted(const std::string& text) {
-    std::string out = "'";
-    for (char c : text) out += c == '\'' ? "''" : std::string(1, c);
-    return out + "'";
   }
 
   // Starts the executable at device path |exec|, as process |pid| if one is given (free, and

@@ -1,4 +1,5 @@
 #include "tests/providers/provider_test_env.h"
+#include "tests/sqlite_rows.h"
 
 namespace _CorvaneLogManager {
 namespace {
@@ -39,10 +40,7 @@ TEST_F(BaseLogProviderTest, InsertAppendsTimestampAndZoneOrLeavesZoneNull) {
     long long after = WallClockMs();
     std::vector<std::string> run = Taken("INSERT");
     ASSERT_EQ(run.size(), 1u);
-    std::string zone;
-    for (const char* z = c.zone; z != nullptr && *z != '\0'; ++z)
-      zone += *z == '\'' ? std::string("''") : std::string(1, *z);
-    if (c.zone) zone = ",'" + zone + "'";
+    std::string zone = c.zone ? "," + SqlQuoted(c.zone) : "";
     std::vector<long long> stamp;
     ASSERT_TRUE(MatchesWithNumbers(run[0],
                                    std::string("INSERT INTO use_app_survey(app_id,duration,"
