@@ -47,8 +47,7 @@ class ReportBuilderTest : public ReportingTest {
     Row("manage_app_survey", "installed_app_id,type", stamp, values);
   }
   std::string Count(DbConnection* conn, const std::string& table) {
-    std::vector<std::string> rows = Column(conn, "SELECT count(*) FROM " + table);
-    return rows.empty() ? "<error>" : rows[0];
+    return Query(conn, "SELECT count(*) FROM " + table);
   }
   std::vector<std::string> Bodies(const std::string& activity) {
     return Column(upload,
