@@ -642,6 +642,7 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   TempSysroot root("keyed", {"/opt/usr/dbspace", "/usr/lib"});
   std::string db = root.Path("/opt/usr/dbspace/keyed.db");
   std::string lib = root.Path("/usr/lib/libsqlite3.so.0");
+  const char kPassword[] = "/opt/usr/dbspace/.SecurePassword.txt";
   SetDbEncryption(true);
   DbConnection conn;
   // A fresh device: the first keyed open makes the password file. The key is the text of
@@ -649,7 +650,7 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   // that open fails; whichever key came out, the outcome must match it.
   int first = conn.Open(db.c_str());
   struct stat st;
-  ASSERT_EQ(stat(root.Path("/opt/usr/dbspace/.SecurePassword.txt").c_str(), &st), 0);
+  ASSERT_EQ(stat(root.Path(kPassword).c_str(), &st), 0);
   EXPECT_EQ(first, ReadKey().empty() ? -1 : 0);
   if (first == 0) {
     EXPECT_EQ(conn.Close(), 0);
@@ -657,10 +658,7 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   // A key with text and no key library under the sysroot: the open goes on unkeyed. A new
   // process finds the key on file and derives none.
   ReleaseKeyParams();
-  FILE* file = fopen(root.Path("/opt/usr/dbspace/.SecurePassword.txt").c_str(), "w");
-  ASSERT_NE(file, nullptr);
-  ASSERT_GE(fputs("k3y", file), 0);
-  ASSERT_EQ(fclose(file), 0);
+  ASSERT_TRUE(root.Write(kPassword, "k3y"));
   EXPECT_EQ(conn.Open(db.c_str()), 0);
   {
     DbConnection::SetupScope setup(&conn);
@@ -674,7 +672,7 @@ TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
   EXPECT_EQ(conn.Handle(), nullptr);
   // An empty key: the open fails, and the file stays as it was.
   ASSERT_EQ(unlink(lib.c_str()), 0);
-  ASSERT_EQ(truncate(root.Path("/opt/usr/dbspace/.SecurePassword.txt").c_str(), 0), 0);
+  ASSERT_EQ(truncate(root.Path(kPassword).c_str(), 0), 0);
   EXPECT_EQ(conn.Open(db.c_str()), -1);
   EXPECT_EQ(ReadKey(), "");
   SetDbEncryption(false);
