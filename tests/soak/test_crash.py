@@ -1,19 +1,9 @@
-"""Crash consistency: LOGMGR_CRASH_ROUNDS times (default 100) the daemon is killed with SIGKILL at
-a random moment while a caller inserts over the bus and a report run aggregates, queues and hands
-over records. Each round seeds three finished days first (every other round, so that the other
-rounds leave the crashed files to the daemon alone) or asks for a run through the dump key.
-
-After each kill the files are copied as they lie and the copy must pass integrity_check; the
-copy also gives what the restart recovery must do: every period open in the snapshot store is
-closed at the latest timestamp of the collection tables and the store, so a row of exactly that
-length appears. After the restart the live files must pass integrity_check again, and the day
-records the restarted daemon hands to the relay keep the duplicate promise of
-docs/RELIABILITY.md: a record is handed over at most as often as the queue held it unmarked at
-the kill (the copy holds only committed records: a table's records of a day are one
-transaction), plus once more only if its table still held rows of its day (a day cut short by
-the kill is built again; with its records in the queue only when the kill fell between the
-table's commit and its purge); a record marked as handed over is never handed over again. The last round
-lets its run finish, so every run ends with day records handed over.
+"""Crash consistency: LOGMGR_CRASH_ROUNDS times (default 100) SIGKILL at a random moment while
+a caller inserts over the bus and a report run works (three finished days seeded every other
+round, else a run asked for through the dump key). The files as the kill left them pass
+integrity_check and tell what recovery must write: each open period closed at the latest stored
+timestamp. After the restart a day record is handed over at most as often as the queue held it
+unmarked, plus once if its table still held rows of its day (a day cut short is rebuilt).
 """
 import datetime
 import os
@@ -86,11 +76,8 @@ class CrashTest(DeviceTestCase):
             for day in (3, 2, 1):
                 base = ss.utc_midnight(now, day) * 1000
                 for i in range(60):
-                    # An app-management row is a record of its own, dated to the second: two
-                    # equal rows in one second would be two equal records, which the count of
-                    # hand-overs below would take for one record handed over twice. Every seeded
-                    # row of a day gets a second of its own (7919 is prime to 86400), spread
-                    # over the whole day.
+                    # A second of its own per row (7919 is prime to 86400): two equal
+                    # install records would look like one handed over twice.
                     self.seeded += 1
                     ts = base + (self.seeded * 7919 % 86400) * 1000 + rnd.randrange(1000)
                     con.execute("INSERT INTO use_app_survey(timestamp,app_id,duration) "

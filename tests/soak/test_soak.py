@@ -1,22 +1,9 @@
-"""Soak: the daemon under steady outside load and random device events for LOGMGR_SOAK_SECONDS
-(default 60) while its clock runs LOGMGR_SOAK_SPEED times fast (default 4320: a day every 20 s),
-so that several midnights pass and their report runs happen in the middle of the load.
-
-Row accounting, for the rows the feature-table callers write (app_id "soak.feature"; the
-daemon's own device rows and the status table's copies carry other app ids):
-  inserted  ids the daemon returned for committed Inserts (counted by the callers);
-  deleted   ids a caller's Delete "_id = N" removed (the daemon answered count 1);
-  reported  the sum of "count" over the day records of soak.feature handed to the relay (the
-            outbox) or still queued in survey_log: what the report runs took;
-  stored    the soak.feature rows left in the table after a clean stop;
-  trimmed   the rest: rows that left the table without a caller's Delete and without a report.
-inserted - deleted - trimmed - reported = stored holds by construction, so the test checks what
-makes it meaningful: stored rows are a subset of inserted-minus-deleted (nothing resurrected or
-invented), no report counts more rows of a 3-hour window than left the table from that window
-(rows' timestamps are learnt from the callers' Selects; a row no Select saw is placed between
-its seen neighbours, since ids and timestamps grow together), and trimmed is zero: the load
-keeps the table far below its row limit and every day is reported before its rows could age out,
-so any trimmed row is a lost row.
+"""Soak: steady bus load and random device events for LOGMGR_SOAK_SECONDS (default 60) on a
+clock LOGMGR_SOAK_SPEED times fast (default 4320: a day every 20 s), so report runs fall inside
+the load. For the feature rows the callers write: stored rows are a subset of inserted minus
+deleted, no report counts more rows of a 3-hour window than left the table from it (timestamps
+learnt from Selects; an unseen row lies between its seen neighbours), and no row leaves the
+table neither deleted nor reported (the load stays far below the row limit).
 """
 import os
 import random
@@ -58,7 +45,6 @@ class SoakTest(DeviceTestCase):
         self.errors = []
         self.events = Counter()
 
-    # --- load ------------------------------------------------------------------------------
     def feature_caller(self, caller):
         rnd = random.Random(1)
         interval = 1.0 / INSERT_RATE
@@ -139,7 +125,6 @@ class SoakTest(DeviceTestCase):
             self.rss.append(ss.vm_rss_kb(pid))
             self.stop.wait(0.5)
 
-    # --- the run ---------------------------------------------------------------------------
     def test_soak(self):
         start = ss.utc_midnight(time.time()) + 20 * 3600
         t0 = time.time()
