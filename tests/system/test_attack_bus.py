@@ -11,7 +11,7 @@ import unittest
 import dbus
 
 from bus_client import (FEATURE, STATUS, Segment, call_as, parse_segment,
-                        prepare_for_other_users, table_proxy)
+                        prepare_for_other_users, raw_call, table_proxy)
 from harness import DeviceTestCase, wait_for
 
 IMPROPER = "Improper Values Provided"
@@ -23,6 +23,7 @@ STALL = ("app_id IN (SELECT a.app_id FROM use_app_feature_survey a, use_app_feat
          "use_app_feature_survey c, use_app_feature_survey d, use_app_feature_survey e, "
          "use_app_feature_survey f WHERE a.value + b.value + c.value + d.value + e.value "
          "+ f.value < 0)")
+BIG = "v" * 100 * 1024
 SHM_HUGETLB, SHM_NORESERVE, IPC_STAT, IPC_SET = 0o4000, 0o10000, 2, 1
 
 
@@ -123,11 +124,44 @@ class AttackBusTest(DeviceTestCase):
             (STATUS, "Update", [{"extra": "a,b"}, "app_id='victim'"], {"error": IMPROPER}),
             (STATUS, "Insert", [{"app_id": "victim", "feature": "S", "extra": "a,b"}],
              {"error": "API Failed"}),
+            (FEATURE, "Delete", ["0; ATTACH DATABASE '" + self.dev.path("/opt/usr/dbspace/x.db")
+                                 + "' AS x"], {"error": "Delete API Failed"}),
+            (FEATURE, "Delete", ["0; PRAGMA user_version=7"], {"error": "Delete API Failed"}),
+            (FEATURE, "Update", [{"extra": "e"}, "app_id IN (SELECT app_id FROM use_app_survey)"],
+             {"error": "Update API Failed"}),
+            (FEATURE, "Insert", [{"app_id": "x', 'y'); DROP TABLE use_app_survey; --",
+                                  "feature": "F"}], {"error": IMPROPER}),
+            (STATUS, "Update", [{"extra": "'||(SELECT app_id FROM use_app_survey)||'"}, "1"],
+             {"error": IMPROPER}),
+            (FEATURE, "Insert", [{"app_id": "x", "feature": "F", "(SELECT 1)": "1"}],
+             {"error": IMPROPER}),
+            (FEATURE, "Insert", [{"app_id": "x", "feature": "F", "timestamp": "1"}],
+             {"error": IMPROPER}),
+            (FEATURE, "Insert", [{"app_id": BIG, "feature": "F"}], {"error": IMPROPER}),
+            (STATUS, "Insert", [{"app_id": BIG, "feature": "F"}], {"error": IMPROPER}),
+            (FEATURE, "Update", [{"extra": BIG}, "1"], {"error": "Update API Failed"}),
+            (FEATURE, "Delete", ["1 OR " + BIG], {"error": "Delete API Failed"}),
         ]
         for table, method, params, expected in attacks:
             with self.subTest(table=table, method=method, params=params):
                 self.assertEqual(self.attack(table, method, *params), expected)
                 self.assert_untouched_and_serving()
+
+        # Arguments of the wrong types or number never reach a table.
+        for signature, method, table, args in (("a{si}", "Insert", FEATURE, [{"app_id": 1}]),
+                                               ("ssss", "Select", FEATURE, ["_id", "", "", "1"]),
+                                               ("i", "Delete", STATUS, [1]),
+                                               ("a{ss}", "Update", FEATURE, [{"extra": "e"}])):
+            with self.subTest(signature=signature, method=method):
+                with self.assertRaises(dbus.DBusException):
+                    raw_call(self.dev, table, method, signature, *args)
+                self.assert_untouched_and_serving()
+        # Select's columns reach no other table, and nothing is written.
+        for columns in ("(SELECT pref_data FROM pref)", "(SELECT app_id FROM use_app_survey)",
+                        "(SELECT sql FROM sqlite_master)", "randomblob(1000000)", BIG):
+            with self.subTest(columns=columns[:40]):
+                answer = self.attack(FEATURE, "Select", columns, "", "", segment=4096)
+                self.assertEqual(answer["segment"], "00" * 4096)
 
         # Controls: the same requests without the second statement, the comma or the large id.
         self.assertEqual(self.attack(STATUS, "Update", {"extra": "a b"}, "app_id='victim'"),

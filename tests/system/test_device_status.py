@@ -1,8 +1,5 @@
-"""Device status features through the real daemon: periods, battery, events, Bluetooth, restarts.
-
-The daemon alone runs on a clock read from a file (libfaketime, frozen between steps) wherever a
-duration is checked, so durations are exact.
-"""
+"""Device status through the real daemon: periods, battery, events, Bluetooth, restarts. Where a
+duration is checked the daemon's clock stands still between steps, so durations are exact."""
 import os
 import signal
 import sqlite3
@@ -19,8 +16,6 @@ APP_ID = "com.corvane.logmanager"
 
 
 class FrozenClock(MsClock):
-    """The daemon's wall clock in whole seconds, standing still until advanced."""
-
     def __init__(self, dev, start=1773136800):
         super().__init__(dev, start * 1000)
 
@@ -43,9 +38,7 @@ class DeviceStatusCase(DeviceTestCase):
         return proc
 
     def wait_monitoring(self):
-        """Unlocks until an UNLO row shows every handler is registered; later rows are new."""
-        # Only an UNLO row counts: the restart recovery writes rows of its own before the
-        # handlers are registered.
+        # An UNLO row shows the handlers registered (recovery writes rows before they are).
         def probe():
             before = self.max_id("UNLO")
             self.dev.devsim("unlock")
@@ -77,7 +70,6 @@ class DeviceStatusCase(DeviceTestCase):
         return rows[0] if rows else ("", 0)
 
     def vconf_marker(self):
-        """Waits until every vconf change made so far has been handled."""
         count = len(self.rows("UNLO"))
         self.dev.devsim("unlock")
         wait_for(lambda: len(self.rows("UNLO")) > count, message="the unlock marker")
@@ -99,12 +91,10 @@ class ChargerTest(DeviceStatusCase):
         self.assertEqual(self.periods(), [("BAT1", "U", 40000), ("CHAR", "U", 3600000),
                                           ("BAT2", "U", 55000)])
         self.assertEqual(self.snapshot("CHAR"), ("", 0))
-        rows = self.dev.query(FEATURE_DB, "SELECT app_id FROM use_app_feature_survey "
-                                          "WHERE _id > ?", (self.base,))
-        self.assertEqual({r[0] for r in rows}, {APP_ID})
+        self.assertEqual(self.dev.query(FEATURE_DB, "SELECT DISTINCT app_id FROM "
+                                        "use_app_feature_survey WHERE _id > ?", (self.base,)),
+                         [(APP_ID,)])
 
-        # Input that must change nothing: an unplug without a plug, a battery file with text,
-        # a status rewritten as a string, a status value outside 0/1.
         bad = [("unplug without plug", lambda: self.dev.devsim("charger", "unplug", "50")),
                ("battery text", self.plug_with_text_capacity),
                ("string status",
@@ -120,8 +110,7 @@ class ChargerTest(DeviceStatusCase):
         # Mains charging carries "A", and charging still works after the bad input.
         clock.advance(60)
         self.dev.devsim("charger", "plug", "ac", "20")
-        # A vconf callback reads the key as it is then: an unplug written before a slow daemon
-        # took the plug would leave it nothing to see.
+        # The plug must be seen before the unplug overwrites the key.
         wait_for(lambda: len(self.rows("BAT1")) == 2, message="the second plug")
         clock.advance(60)
         self.dev.devsim("charger", "unplug", "21")
