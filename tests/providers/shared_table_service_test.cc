@@ -139,6 +139,9 @@ TEST_F(SharedTableServiceTest, SelectWritesOnlyTheCallersLargeEnoughSegment) {
     int shm = shmget(IPC_PRIVATE, c.size, IPC_CREAT | 0600);
     ASSERT_NE(shm, -1);
     EXPECT_EQ(status->Select(c.columns, shm, c.known, c.caller), c.result);
+    struct shmid_ds info;
+    ASSERT_EQ(shmctl(shm, IPC_STAT, &info), 0);
+    EXPECT_EQ(info.shm_nattch, 0u) << "left attached";
     const char* base = static_cast<const char*>(shmat(shm, nullptr, SHM_RDONLY));
     std::string content(base, c.size);
     EXPECT_EQ(content, c.result == Result::kOk ? kResult + std::string(c.size - 6, '\0')

@@ -83,43 +83,17 @@ std::string FormattedRow(sqlite3_stmt* stmt) {
 }
 
 TEST_F(DbConnectionTest, RendersEveryCellAsTheFormattedRenderingDid) {
-  const char* values[] = {"0",
-                          "-1",
-                          "9",
-                          "10",
-                          "-10",
-                          "99999999999999999",
-                          "999999999999999999",
-                          "1000000000000000000",
-                          "-99999999999999999",
-                          "-999999999999999999",
-                          "9223372036854775807",
-                          "-9223372036854775808",
-                          "0.0",
-                          "-1.5",
-                          "1e15",
-                          "-1e300",
-                          "1e-300",
-                          "123456.7890125",
-                          "''",
-                          "','",
-                          "'a,b,'",
-                          "CAST(x'610062' AS TEXT)",
-                          "CAST(x'00' AS TEXT)",
-                          "printf('%.297c', 'a')",
-                          "printf('%.298c', 'b')",
-                          "printf('%.299c', 'c')",
-                          "printf('%.300c', 'd')",
-                          "printf('%.1000c', 'e')",
-                          "printf('%.297c', 'f') || 'éé'",
-                          "x''",
-                          "x'00'",
-                          "x'6100'",
-                          "x'616263'",
-                          "zeroblob(3)",
-                          "CAST(printf('%.299c', 'g') AS BLOB)",
-                          "CAST(printf('%.300c', 'h') AS BLOB)",
-                          "NULL"};
+  // clang-format off
+  const char* values[] = {
+      "0", "-1", "9", "10", "-10", "99999999999999999", "999999999999999999", "1000000000000000000",
+      "-99999999999999999", "-999999999999999999", "9223372036854775807", "-9223372036854775808",
+      "0.0", "-1.5", "1e15", "-1e300", "1e-300", "123456.7890125", "''", "','", "'a,b,'",
+      "CAST(x'610062' AS TEXT)", "CAST(x'00' AS TEXT)", "printf('%.297c', 'a')",
+      "printf('%.298c', 'b')", "printf('%.299c', 'c')", "printf('%.300c', 'd')",
+      "printf('%.1000c', 'e')", "printf('%.297c', 'f') || 'éé'", "x''", "x'00'", "x'6100'",
+      "x'616263'", "zeroblob(3)", "CAST(printf('%.299c', 'g') AS BLOB)",
+      "CAST(printf('%.300c', 'h') AS BLOB)", "NULL"};
+  // clang-format on
   Setup({"CREATE TABLE v(id INTEGER PRIMARY KEY, x);"});
   for (const char* value : values) {
     ASSERT_EQ(conn.Exec((std::string("INSERT INTO v(x) VALUES(") + value + ");").c_str()), 0);
@@ -407,24 +381,6 @@ TEST_F(DbConnectionTest, AStepThatEndsInAnErrorIsAFailure) {
   EXPECT_EQ(Select("SELECT v FROM t WHERE id = 2;", "t"), Rows{"1,"}) << "nothing changed";
 }
 
-// A statement on another thread, as the report worker runs one while the main loop serves.
-struct OtherThread {
-  DbConnection* conn;
-  const char* sql;
-  int result = 1;
-  static void* Run(void* arg) {
-    OtherThread* self = static_cast<OtherThread*>(arg);
-    self->result = self->conn->Exec(self->sql);
-    return nullptr;
-  }
-  int Go() {
-    pthread_t thread;
-    if (pthread_create(&thread, nullptr, Run, this) != 0) return 2;
-    pthread_join(thread, nullptr);
-    return result;
-  }
-};
-
 TEST_F(DbConnectionTest, ABusRequestTouchesOneTableWithinItsBudgetAndResultLimit) {
   Setup({"CREATE TABLE own(a);", "CREATE TABLE other(b);"});
   ASSERT_EQ(conn.Exec("BEGIN;"), 0);
@@ -463,7 +419,9 @@ TEST_F(DbConnectionTest, ABusRequestTouchesOneTableWithinItsBudgetAndResultLimit
       EXPECT_EQ(conn.Exec(c.sql), c.allowed ? 0 : -1);
     }
     // The scope is this thread's: the worker's statements meanwhile stay the daemon's own.
-    EXPECT_EQ((OtherThread{&conn, "INSERT INTO other VALUES(2);"}.Go()), 0);
+    int other = 1;
+    std::thread([&] { other = conn.Exec("INSERT INTO other VALUES(2);"); }).join();
+    EXPECT_EQ(other, 0);
     DbConnection::SetupScope nested(&conn);  // a second scope is never entered
     EXPECT_EQ(conn.Exec("CREATE TABLE x(c);"), -1);
   }
@@ -516,21 +474,9 @@ TEST_F(DbConnectionTest, KeptStatementsServeOnlyTheScopeTheyWereJudgedFor) {
     EXPECT_EQ(conn.ExecKept(intoOther, row, 1), DbConnection::kNotRun);
     EXPECT_EQ(conn.ExecKept(intoOwn, row, 1), 0);
     // Meanwhile another thread's statements stay the daemon's own, kept statement included.
-    struct Daemon {
-      DbConnection* conn;
-      const char* sql;
-      const DbConnection::BoundValue* row;
-      int result = 2;
-      static void* Run(void* arg) {
-        Daemon* self = static_cast<Daemon*>(arg);
-        self->result = self->conn->ExecKept(self->sql, self->row, 1);
-        return nullptr;
-      }
-    } daemon{&conn, intoOther, row};
-    pthread_t thread;
-    ASSERT_EQ(pthread_create(&thread, nullptr, Daemon::Run, &daemon), 0);
-    ASSERT_EQ(pthread_join(thread, nullptr), 0);
-    EXPECT_EQ(daemon.result, 0);
+    int daemon = 2;
+    std::thread([&] { daemon = conn.ExecKept(intoOther, row, 1); }).join();
+    EXPECT_EQ(daemon, 0);
   }
   {
     DbConnection::BusRequestScope request(&conn, "other");
@@ -615,27 +561,6 @@ TEST_F(DbConnectionTest, KeptStatementsAnswerAsExecAndAnEndedThreadsTransactionR
   EXPECT_EQ(conn.CommitTransaction(), 0);
   EXPECT_EQ(conn.CommitTransaction(), -1);
   EXPECT_FALSE(conn.InTransaction());
-}
-
-TEST_F(DbConnectionTest, NewFilesAreOwnerOnlyWhateverTheUmask) {
-  ASSERT_EQ(conn.Close(), 0);
-  mode_t old = umask(0);
-  std::string fresh = dir + "/fresh.db";
-  DbConnection wide;
-  ASSERT_EQ(wide.Open(fresh.c_str()), 0);
-  umask(old);
-  {
-    DbConnection::SetupScope setup(&wide);
-    ASSERT_EQ(wide.Exec("CREATE TABLE t(x);"), 0);
-  }
-  ASSERT_EQ(wide.Exec("INSERT INTO t VALUES(1);"), 0);
-  for (const char* suffix : {"", "-wal", "-shm"}) {
-    SCOPED_TRACE(suffix);
-    struct stat st;
-    ASSERT_EQ(stat((fresh + suffix).c_str(), &st), 0);
-    EXPECT_EQ(st.st_mode & 0777, 0600u);
-  }
-  EXPECT_EQ(wide.Close(), 0);
 }
 
 TEST(KeyedOpenTest, OutcomesOfTheKeyedBranch) {
