@@ -118,25 +118,6 @@ class AppCase(DeviceTestCase):
 
 class AppUsageTest(AppCase):
 
-    def test_lock_screen_ends_the_period_and_starts_none(self):
-        self.focus(ALPHA)
-        self.focus(LOCK)
-        wait_for(lambda: self.periods("pkg.alpha"), message="alpha's period")
-        self.focus(BETA)
-        self.focus(ALPHA)
-        wait_for(lambda: self.periods("pkg.beta"), message="beta's period")
-        self.assertEqual([r[0] for r in self.periods()], ["pkg.alpha", "pkg.beta"])
-
-    def test_screen_off_ends_the_period_and_screen_on_starts_a_new_one(self):
-        self.focus(ALPHA)
-        self.dev.devsim("screen", "off")
-        wait_for(lambda: self.periods("pkg.alpha"), message="alpha's period at screen off")
-        self.focus(BETA)  # while the screen is off: no period for anyone
-        self.dev.devsim("screen", "on")
-        self.focus(ALPHA)
-        wait_for(lambda: self.periods("pkg.beta"), message="beta's period from screen on")
-        self.assertEqual([r[0] for r in self.periods()], ["pkg.alpha", "pkg.beta"])
-
     def test_bad_input_is_skipped_and_later_events_still_count(self):
         self.focus(BETA)
         self.aul("app_launch", "string:123")
