@@ -8,7 +8,7 @@ import dbus
 from dbus.mainloop.glib import DBusGMainLoop
 from gi.repository import GLib
 
-from bus_client import (FEATURE, IFACE_PREFIX, PATH_PREFIX, STATUS, Segment, parse_segment,
+from bus_client import (FEATURE, IFACE_PREFIX, PATH_PREFIX, STATUS, Segment,
                         table_proxy)
 from harness import DeviceTestCase, wait_for
 from test_lifecycle import has_consent_watch
@@ -82,22 +82,6 @@ class BusServiceTest(DeviceTestCase):
         self.assertEqual(self.status.Delete("app_id='x'"), 2)
         self.assertEqual(self.table_rows(FEATURE), [("x", "F", "e", 1)])
 
-    def test_a_new_status_pair_is_inserted_whole_and_only_an_existing_one_is_updated(self):
-        # Values too long for an update's 200-byte lists, and a comma, which an update would cut:
-        # a new (app_id, feature) pair is an insert and takes them as they are.
-        extra = "e" * 150 + ",x"
-        row_id = self.status.Insert({"app_id": "a", "feature": "F", "extra": extra, "value": "1"})
-        self.assertEqual(self.table_rows(STATUS), [("a", "F", extra, 1)])
-        # The same pair again is an update: refused with the upsert's failure, row unchanged.
-        for values in ({"extra": extra}, {"extra": "a,b"}, {"extra": "e" * 180}):
-            with self.subTest(values=values):
-                self.assert_bus_error(lambda: self.status.Insert(
-                    {"app_id": "a", "feature": "F", "value": "2", **values}), "API Failed")
-                self.assertEqual(self.table_rows(STATUS), [("a", "F", extra, 1)])
-        self.assertEqual(self.status.Insert({"app_id": "a", "feature": "F", "extra": "short",
-                                             "value": "3"}), row_id)
-        self.assertEqual(self.table_rows(STATUS), [("a", "F", "short", 3)])
-
     def test_the_main_loop_never_waits_for_another_process_lock(self):
         self.feature.Insert({"app_id": "x", "feature": "F"})
         holder = sqlite3.connect(self.dev.db_path(".SurveyLog.db"), timeout=5,
@@ -130,13 +114,6 @@ class BusServiceTest(DeviceTestCase):
         self.feature.Select("app_id,value", "app_id='y'", "value DESC", dbus.UInt32(seg.id))
         self.assertEqual(seg.read()[:11], b"x,1,\0y,2,\0&")
 
-        # Exactly the result's size is enough; one byte less is refused without a write.
-        exact, short = self.segment(11), self.segment(10)
-        self.feature.Select("app_id,value", "", "", dbus.UInt32(exact.id))
-        self.assertEqual(parse_segment(exact.read()), ["x,1,", "y,2,"])
-        with self.assertRaises(dbus.DBusException):
-            self.feature.Select("app_id,value", "", "", dbus.UInt32(short.id))
-        self.assertEqual(short.read(), bytes(10))
         # A one-byte segment holds the end mark of an empty result, nothing more.
         one = self.segment(1)
         with self.assertRaises(dbus.DBusException):

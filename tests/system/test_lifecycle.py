@@ -4,7 +4,7 @@ import signal
 import subprocess
 import unittest
 
-from harness import CONSENT_KEY, DBSPACE, DeviceTestCase, wait_for
+from harness import DBSPACE, DeviceTestCase, wait_for
 
 
 def has_consent_watch(pid):
