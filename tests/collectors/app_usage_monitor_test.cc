@@ -111,17 +111,6 @@ TEST_F(AppUsageMonitorTest, ScreenOffClosesThePeriodAndScreenOnStartsTheNext) {
   EXPECT_EQ(Periods(), "pkg.alpha:3000;pkg.beta:2000;");
 }
 
-TEST_F(AppUsageMonitorTest, DeathWritesOnlyAfterTheShortestPeriod) {
-  ActivateAt(kT0, beta);
-  ActivateAt(kT0 + 10, alpha);  // beta's 10 ms are written; alpha's period starts
-  g_now = kT0 + 110;
-  EXPECT_EQ(AppUsageMonitor::DeadHandler(alpha, monitor.get()), 0);  // 100 ms: nothing
-  g_now = kT0 + 2010;
-  EXPECT_EQ(AppUsageMonitor::DeadHandler(beta, monitor.get()), 0);  // not in front, still recorded
-  EXPECT_EQ(AppUsageMonitor::DeadHandler(beta, monitor.get()), 0);  // no longer tracked
-  EXPECT_EQ(Periods(), "pkg.beta:10;pkg.beta:2000;");
-}
-
 TEST_F(AppUsageMonitorTest, DropsPeriodsOutsideTheBounds) {
   struct Case {
     int64_t length;
