@@ -31,35 +31,6 @@ class StatusSnapshotStoreTest : public ::testing::Test {
   const std::string sysroot = tmp.path();
 };
 
-TEST_F(StatusSnapshotStoreTest, KeepsOneRowPerFeature) {
-  StatusSnapshotStore* store = Open();
-  ASSERT_NE(store, nullptr);
-  std::string extra = "unchanged";
-  int64_t ts = -5;
-  ASSERT_EQ(store->Get("SCRN", &extra, &ts), 0);
-  EXPECT_EQ(extra, "");
-  EXPECT_EQ(ts, 0);
-
-  ASSERT_EQ(store->Put("BLUE", "1025", 1700000000123LL), 0);
-  ASSERT_EQ(store->Put("BLUE", "515", 1700000000999LL), 0);
-  ASSERT_EQ(store->Put("SCRN", "", 1700000000500LL), 0);
-  EXPECT_EQ(Dump(), "BLUE|515|1700000000999;SCRN||1700000000500;");
-  ASSERT_EQ(store->Get("BLUE", &extra, &ts), 0);
-  EXPECT_EQ(extra, "515");
-  EXPECT_EQ(ts, 1700000000999LL);
-  ASSERT_EQ(store->Get("SCRN", &extra, &ts), 0);
-  EXPECT_EQ(extra, "");
-  EXPECT_EQ(ts, 1700000000500LL);
-  EXPECT_EQ(store->LatestTimestamp(), 1700000000999LL);
-
-  // Closing a period is a write of "" and 0.
-  ASSERT_EQ(store->Put("BLUE", "", 0), 0);
-  ASSERT_EQ(store->Get("BLUE", &extra, &ts), 0);
-  EXPECT_EQ(extra, "");
-  EXPECT_EQ(ts, 0);
-  EXPECT_EQ(store->LatestTimestamp(), 1700000000500LL);
-}
-
 TEST_F(StatusSnapshotStoreTest, RejectsWhatTheStatementCannotCarry) {
   StatusSnapshotStore* store = Open();
   ASSERT_NE(store, nullptr);
