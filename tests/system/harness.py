@@ -175,6 +175,19 @@ class Device:
         finally:
             con.close()
 
+    def pref(self, key):
+        rows = self.query(".pref.db", "SELECT pref_data FROM pref WHERE pref_key = ?", (key,))
+        return rows[0][0] if rows else None
+
+    def set_pref(self, key, value):
+        """Writes a preference (None removes it) beside the daemon, as another process would."""
+        con = sqlite3.connect(self.db_path(".pref.db"), timeout=10)
+        with con:
+            con.execute("DELETE FROM pref WHERE pref_key = ?", (key,))
+            if value is not None:
+                con.execute("INSERT INTO pref VALUES(?, ?)", (key, str(value)))
+        con.close()
+
     # --- tools -----------------------------------------------------------------------------
     def run_tool(self, name, *args, check=True, env=None):
         return subprocess.run([os.path.join(BIN_DIR, name)] + [str(a) for a in args],
@@ -250,6 +263,13 @@ class Device:
             return proc.wait(timeout * TIMEOUT_SCALE)
         except subprocess.TimeoutExpired:
             raise AssertionError(f"logmgrd did not exit within {timeout}s")
+
+    def survey_tables(self):
+        return self.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master WHERE name LIKE "
+                          "'%_survey'") == [(5,)]
+
+    def wait_tables(self):
+        wait_for(self.survey_tables, message="the survey tables")
 
     def wait_started(self, timeout=10.0):
         """Waits until the deferred start has created the databases."""

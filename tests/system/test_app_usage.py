@@ -48,6 +48,33 @@ def root_watched(display_name):
         d.close()
 
 
+def in_front_at_known_time(dev, clock, app, gamma, gamma_package):
+    """Brings |gamma| to the front and then |app| until the daemon shows it took both in step
+    with the clock (a row of |gamma| of exactly this probe's length): |app|'s period then starts
+    now. Returns the rows of |gamma_package| so far."""
+    attempts = []
+
+    def rows():
+        return dev.query(".SurveyLog.db", "SELECT app_id, duration FROM use_app_survey WHERE "
+                         "app_id = ? ORDER BY _id", (gamma_package,))
+
+    def probe():
+        # Each probe steps the clock by its own length, so a late row of an earlier probe never
+        # passes for this one; X events are handled in order, so nothing is pending after it.
+        attempts.append(1000 + len(attempts))
+        count = len(rows())
+        dev.devsim("app", "focus", gamma)
+        clock.advance_ms(attempts[-1])
+        dev.devsim("app", "focus", app)
+        try:
+            new = wait_for(lambda: rows()[count:], timeout=10)
+        except AssertionError:
+            return False
+        return new[-1][1] == attempts[-1]
+    wait_for(probe, timeout=60, interval=0, message="the daemon to follow the windows")
+    return rows()
+
+
 class AppCase(DeviceTestCase):
     WITH_X = True
     FROZEN = False  # the daemon's wall clock stands still until the test advances it
@@ -86,31 +113,11 @@ class AppCase(DeviceTestCase):
         return [r for r in rows if package is None or r[0] == package]
 
     def in_front_at_known_time(self, app):
-        """Brings gamma to the front and then |app|, until the daemon shows it took both in
-        step with the clock (a gamma row of exactly this probe's length); |app|'s period then
-        starts now. Returns the gamma rows written so far."""
         if GAMMA not in self.pids:
             self.dev.devsim("app", "install", GAMMA)
             self.pids[GAMMA] = int(self.dev.devsim("app", "launch", GAMMA).stdout)
             self.addCleanup(self.dev.devsim, "app", "kill", GAMMA, check=False)
-        attempts = []
-
-        def probe():
-            # Each probe steps the clock by its own length, so a row left by an earlier probe
-            # that a slow daemon handles late never passes for this one; X events are handled
-            # in order, so this probe's row being the last means nothing is pending.
-            attempts.append(1000 + len(attempts))
-            count = len(self.periods(GAMMA))
-            self.focus(GAMMA)
-            self.clock.advance_ms(attempts[-1])
-            self.focus(app)
-            try:
-                rows = wait_for(lambda: self.periods(GAMMA)[count:], timeout=10)
-            except AssertionError:
-                return False
-            return rows[-1] == (GAMMA, attempts[-1])
-        wait_for(probe, timeout=60, interval=0, message="the daemon to follow the windows")
-        return self.periods(GAMMA)
+        return in_front_at_known_time(self.dev, self.clock, app, GAMMA, GAMMA)
 
     def aul(self, member, *args):
         self.dev.dbus_send("--type=signal", AUL[0], f"{AUL[1]}.{member}", *args)

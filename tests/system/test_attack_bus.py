@@ -47,9 +47,7 @@ class AttackBusTest(DeviceTestCase):
         super().setUp()
         self.dev.set_consent(True)
         self.dev.start_daemon()
-        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
-                                        "WHERE name LIKE '%_survey'") == [(5,)],
-                 message="the survey tables")
+        self.dev.wait_tables()
         # The scheduler starts last (sent date, then the dump key): the snapshot comes after it.
         wait_for(lambda: self.dev.vconf_get("db/corvane-log-manager/dumpcontext") is not None,
                  message="the daemon's whole start")

@@ -6,19 +6,14 @@ import subprocess
 import unittest
 
 from bus_client import FEATURE, STATUS, prepare_for_other_users
-from harness import BIN_DIR, DeviceTestCase, wait_for
-
-NOBODY = ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"]
-
+from harness import BIN_DIR, NOBODY, DeviceTestCase
 
 class BusClientsTest(DeviceTestCase):
 
     def start(self):
         self.dev.set_consent(True)
         self.dev.start_daemon()
-        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
-                                        "WHERE name LIKE '%_survey'") == [(5,)],
-                 message="the survey tables")
+        self.dev.wait_tables()
 
     def ctl(self, *args, prefix=()):
         r = subprocess.run(list(prefix) + [os.path.join(BIN_DIR, "logmgrctl")] +

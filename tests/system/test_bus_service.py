@@ -10,13 +10,10 @@ from gi.repository import GLib
 
 from bus_client import (FEATURE, IFACE_PREFIX, PATH_PREFIX, STATUS, Segment,
                         table_proxy)
-from harness import DeviceTestCase, wait_for
+from harness import NOBODY, DeviceTestCase, wait_for
 from test_lifecycle import has_consent_watch
 
 IMPROPER = "Improper Values Provided"
-NOBODY = ["setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"]
-
-
 class BusServiceTest(DeviceTestCase):
 
     def setUp(self):
@@ -24,9 +21,7 @@ class BusServiceTest(DeviceTestCase):
         self.dev.set_consent(True)
         self.dev.start_daemon()
         self.dev.wait_started()
-        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
-                                        "WHERE name LIKE '%_survey'") == [(5,)],
-                 message="the survey tables")
+        self.dev.wait_tables()
         self.feature = table_proxy(self.dev, FEATURE)
         self.status = table_proxy(self.dev, STATUS)
 
@@ -151,9 +146,7 @@ class StartTogetherTest(DeviceTestCase):
         wait_for(lambda: len(self.dev.name_queue()) == 2 or None not in (first.poll(),
                                                                         second.poll()),
                  message="both daemons on the bus")
-        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
-                                        "WHERE name LIKE '%_survey'") == [(5,)]
-                 and self.dev.query(".ServerUploaderDB.db", "SELECT COUNT(*) FROM "
+        wait_for(lambda: self.dev.survey_tables() and self.dev.query(".ServerUploaderDB.db", "SELECT COUNT(*) FROM "
                                     "sqlite_master") == [(2,)],
                  message="the tables")
         # Each has opened its stores once it watches the consent key (or it has ended).

@@ -13,7 +13,7 @@ import zlib
 from unittest import mock
 
 from harness import DBSPACE, Device, wait_for
-from test_app_usage import MsClock, root_watched
+from test_app_usage import MsClock, in_front_at_known_time, root_watched
 
 ZONE = "Asia/Seoul"
 DAY = "2026-03-10"  # the clock starts at 19:00 there
@@ -137,12 +137,6 @@ class DayPageTest(unittest.TestCase):
         return cls.dev.query(".SurveyLog.db", sql)
 
     @classmethod
-    def at(cls, step):
-        """Runs |step| and waits for the feature row or open period it makes; returns the time."""
-        wait_for(step, timeout=30, interval=0.2, message=step.__doc__)
-        return cls.clock.now_ms
-
-    @classmethod
     def drive_day(cls):
         dev, clock = cls.dev, cls.clock
         wait_for(lambda: dev.devsim("unlock") and cls.rows(
@@ -154,23 +148,8 @@ class DayPageTest(unittest.TestCase):
                  and root_watched(dev.env["DISPLAY"]), timeout=30, interval=0.2,
                  message="the daemon to watch the root window")
 
-        attempts = []
-
-        def gamma_then_alpha():
-            """gamma's row of this probe's length, so that alpha's period starts now"""
-            # Its own length per probe: a late row of an earlier probe never passes for it.
-            attempts.append(1000 + len(attempts))
-            gamma = "SELECT duration FROM use_app_survey WHERE app_id='pkg.gamma' ORDER BY _id"
-            count = len(cls.rows(gamma))
-            dev.devsim("app", "focus", "com.ex.gamma")
-            clock.advance_ms(attempts[-1])
-            dev.devsim("app", "focus", "com.ex.alpha")
-            try:
-                rows = wait_for(lambda: cls.rows(gamma)[count:], timeout=10)
-            except AssertionError:
-                return False
-            return rows[-1] == (attempts[-1],)
-        cls.alpha_from = cls.at(gamma_then_alpha)
+        in_front_at_known_time(dev, clock, "com.ex.alpha", "com.ex.gamma", "pkg.gamma")
+        cls.alpha_from = clock.now_ms
         for app, ms in (("com.ex.beta", 300000), ("com.corvane.lockscreen", 180000)):
             clock.advance_ms(ms)
             dev.devsim("app", "focus", app)

@@ -2,7 +2,6 @@
 duration is checked the daemon's clock stands still between steps, so durations are exact."""
 import os
 import signal
-import sqlite3
 import subprocess
 
 import dbus
@@ -51,11 +50,8 @@ class DeviceStatusCase(DeviceTestCase):
 
     def max_id(self, feature=None):
         where = " WHERE feature = ?" if feature else ""
-        try:
-            rows = self.dev.query(FEATURE_DB, "SELECT MAX(_id) FROM use_app_feature_survey" + where,
-                                  (feature,) if feature else ())
-        except sqlite3.OperationalError:  # the table is not created yet
-            return 0
+        rows = self.dev.query(FEATURE_DB, "SELECT MAX(_id) FROM use_app_feature_survey" + where,
+                              (feature,) if feature else ())
         return (rows[0][0] or 0) if rows else 0
 
     def rows(self, *features):

@@ -5,7 +5,6 @@ import configparser
 import os
 import re
 import signal
-import sqlite3
 import stat
 import subprocess
 import time
@@ -79,9 +78,7 @@ class FilesCase(DeviceTestCase):
         if consent:
             self.dev.set_consent(True)
         proc = self.dev.start_daemon(**kwargs)
-        wait_for(lambda: self.dev.query(".SurveyLog.db", "SELECT COUNT(*) FROM sqlite_master "
-                                        "WHERE name LIKE '%_survey'") == [(5,)],
-                 message="the survey tables")
+        self.dev.wait_tables()
         return proc
 
     def listen(self, count, interfaces):
@@ -211,16 +208,9 @@ class KeyFilesTest(FilesCase):
 
 class OutboxAndDatabasesTest(FilesCase):
 
-    def pref(self, key):
-        rows = self.dev.query(".pref.db", "SELECT pref_data FROM pref WHERE pref_key=?", (key,))
-        return rows[0][0] if rows else None
-
     def set_prefs(self, sent):
-        con = sqlite3.connect(self.dev.db_path(".pref.db"), timeout=10)
-        con.execute("INSERT OR REPLACE INTO pref VALUES('key_sent_date',?)", (str(sent),))
-        con.execute("DELETE FROM pref WHERE pref_key='key_delete_date'")
-        con.commit()
-        con.close()
+        self.dev.set_pref("key_sent_date", sent)
+        self.dev.set_pref("key_delete_date", None)
 
     def test_outbox_never_follows_a_link_and_files_are_owner_only_under_umask_0(self):
         umask0 = ["sh", "-c", 'umask 000; exec "$0" "$@"']  # memcheck's arguments follow
@@ -228,7 +218,7 @@ class OutboxAndDatabasesTest(FilesCase):
         two_days_ago = int(time.mktime((tm.tm_year, tm.tm_mon, tm.tm_mday - 2, 0, 0, 0, 0, 0,
                                         -1)))
         proc = self.start(prefix=umask0)
-        wait_for(lambda: self.pref("key_sent_date"), message="the first start")
+        wait_for(lambda: self.dev.pref("key_sent_date"), message="the first start")
         proc.send_signal(signal.SIGTERM)
         self.assertEqual(self.dev.wait_exit(proc), 0)
 
@@ -241,7 +231,7 @@ class OutboxAndDatabasesTest(FilesCase):
         self.set_prefs(two_days_ago)
         proc = self.dev.start_daemon(prefix=umask0)
         # The run ends with the weekly purge date: by then the hand-over was tried.
-        wait_for(lambda: self.pref("key_delete_date"), timeout=30, message="the report run")
+        wait_for(lambda: self.dev.pref("key_delete_date"), timeout=30, message="the report run")
         with open(target) as f:
             self.assertEqual(f.read(), "keep\n")
         self.assertTrue(os.path.islink(outbox))

@@ -2,7 +2,6 @@
 import os
 import re
 import signal
-import sqlite3
 import time
 import unittest
 
@@ -13,40 +12,32 @@ ID_PATTERN = re.compile(r"^T[a-zA-Z0-9]{12}[0-9]{13}[A-Z][a-z][0-9][0-9][A-Z][a-
 
 class StorageTest(DeviceTestCase):
 
-    def pref(self, key):
-        try:
-            rows = self.dev.query(".pref.db", "SELECT pref_data FROM pref WHERE pref_key = ?",
-                                  (key,))
-        except sqlite3.OperationalError:  # the table is not there yet
-            return None
-        return rows[0][0] if rows else None
-
     def start(self):
         self.dev.set_consent(True)
         proc = self.dev.start_daemon()
         self.assertIsNone(proc.poll(), "logmgrd ended at start")
-        return wait_for(lambda: self.pref("key_deviceid"), message="the device id")
+        return wait_for(lambda: self.dev.pref("key_deviceid"), message="the device id")
 
     def test_shutdown_time_written_at_stop_and_device_id_kept(self):
         device_id = self.start()
         self.assertRegex(device_id, ID_PATTERN)
-        self.assertIsNone(self.pref("key_last_shutdown_time"))
+        self.assertIsNone(self.dev.pref("key_last_shutdown_time"))
 
         before = int(time.time())
         self.dev.signal(signal.SIGTERM)
         self.assertEqual(self.dev.wait_exit(), 0)
         after = time.time()
-        stopped = int(self.pref("key_last_shutdown_time"))
+        stopped = int(self.dev.pref("key_last_shutdown_time"))
         self.assertGreaterEqual(stopped, before)
         self.assertLessEqual(stopped, after + 1)
 
         proc = self.dev.start_daemon()
         wait_for(lambda: self.dev.name_owner() is not None, message="the restarted daemon")
         self.assertIsNone(proc.poll())
-        self.assertEqual(self.pref("key_deviceid"), device_id)
+        self.assertEqual(self.dev.pref("key_deviceid"), device_id)
         proc.send_signal(signal.SIGTERM)
         self.assertEqual(self.dev.wait_exit(proc), 0)
-        self.assertEqual(self.pref("key_deviceid"), device_id)
+        self.assertEqual(self.dev.pref("key_deviceid"), device_id)
 
     def test_unusable_store_ends_the_start_without_touching_the_file(self):
         path = self.dev.db_path(".pref.db")
