@@ -20,8 +20,7 @@ inline std::string FileRows(const std::string& path, const std::string& sql, con
   while (stmt != nullptr && sqlite3_step(stmt) == SQLITE_ROW) {
     for (int i = 0; i < sqlite3_column_count(stmt); ++i) {
       const unsigned char* text = sqlite3_column_text(stmt, i);
-      if (i > 0) out += sep;
-      out += text != nullptr ? reinterpret_cast<const char*>(text) : null;
+      out += (i > 0 ? sep : "") + std::string(text ? reinterpret_cast<const char*>(text) : null);
     }
     out += ';';
   }

@@ -18,18 +18,11 @@ class TempSysroot {
   // |dirs| are made beneath the root right away, e.g. {"/opt/usr/dbspace", "/etc"}.
   explicit TempSysroot(const char* tag, std::initializer_list<const char*> dirs = {}) {
     std::string tmpl = std::string("/tmp/logmgr-") + tag + "-XXXXXX";
-    if (mkdtemp(&tmpl[0]) == nullptr) {
-      perror("mkdtemp");
-      abort();
-    }
+    if (mkdtemp(&tmpl[0]) == nullptr) Fail("mkdtemp");
     path_ = tmpl;
     setenv("LOGMGR_SYSROOT", path_.c_str(), 1);
-    for (const char* dir : dirs) {
-      if (!MakeDir(dir)) {
-        perror(dir);
-        abort();
-      }
-    }
+    for (const char* dir : dirs)
+      if (!MakeDir(dir)) Fail(dir);
   }
   ~TempSysroot() {
     unsetenv("LOGMGR_SYSROOT");
@@ -40,7 +33,6 @@ class TempSysroot {
   TempSysroot& operator=(const TempSysroot&) = delete;
 
   const std::string& path() const { return path_; }
-  // |rel| ("/etc/os-release") under the root.
   std::string Path(const std::string& rel) const { return path_ + rel; }
 
   // mkdir -p of |rel| under the root.
@@ -67,11 +59,14 @@ class TempSysroot {
   bool SetLocaltime(const std::string& zone) const {
     std::string link = Path("/opt/etc/localtime");
     (void)unlink(link.c_str());
-    if (zone.empty()) return true;
-    return MakeDir("/opt/etc") && symlink(zone.c_str(), link.c_str()) == 0;
+    return zone.empty() || (MakeDir("/opt/etc") && symlink(zone.c_str(), link.c_str()) == 0);
   }
 
  private:
+  [[noreturn]] static void Fail(const char* what) {
+    perror(what);
+    abort();
+  }
   std::string path_;
 };
 

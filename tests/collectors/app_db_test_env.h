@@ -1,5 +1,5 @@
-// Fixture of the app collector tests: a temp sysroot with the survey database open through the
-// real registry, an app database, and real processes running copies of a small program.
+// App collector fixture: the survey database through the real registry, an app database, and
+// real processes running copies of sleep.
 #ifndef LOGMGR_TESTS_COLLECTORS_APP_DB_TEST_ENV_H_
 #define LOGMGR_TESTS_COLLECTORS_APP_DB_TEST_ENV_H_
 
@@ -27,8 +27,8 @@ namespace _CorvaneLogManager {
 class AppDbTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    unsetenv("DISPLAY");  // window tracking needs X; these tests drive the monitors directly
-    setenv("ECORE_NO_SYSTEM_MODULES", "1", 1);  // they would look for a system bus
+    unsetenv("DISPLAY");  // the tests drive the monitors directly, without X
+    setenv("ECORE_NO_SYSTEM_MODULES", "1", 1);
     ASSERT_EQ(
         Sh("mkdir -p '" + sysroot + "/opt/usr/dbspace' '" + sysroot + "/opt/dbspace' '" + sysroot +
            "/opt/etc' && ln -s /usr/share/zoneinfo/UTC '" + sysroot + "/opt/etc/localtime'"),
@@ -93,7 +93,6 @@ class AppDbTest : public ::testing::Test {
     return static_cast<pid_t>(child);
   }
 
-  // Rows of |sql| on the survey database, columns joined by ':' and rows ended by ';'.
   std::string Rows(const std::string& sql) {
     return FileRows(sysroot + "/opt/usr/dbspace/.SurveyLog.db", sql);
   }

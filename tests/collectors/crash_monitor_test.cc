@@ -7,10 +7,12 @@
 namespace _CorvaneLogManager {
 namespace {
 
-// The crash service's sender, as root; untrusted senders are the sender check's own tests.
+// The crash service runs as root (:1.7), an app as nobody (:1.9); other names are unknown.
 int FakeUidLookup(DBusConnection*, const char* sender, uid_t* uid) {
-  *uid = 0;
-  return strcmp(sender, ":1.7") == 0 ? 0 : -1;
+  bool root = strcmp(sender, ":1.7") == 0;
+  if (!root && strcmp(sender, ":1.9") != 0) return -1;
+  *uid = root ? 0 : 65534;
+  return 0;
 }
 
 class CrashMonitorTest : public AppDbTest {
@@ -24,44 +26,46 @@ class CrashMonitorTest : public AppDbTest {
     AppDbTest::TearDown();
   }
   // Passes a signal through the filter, which must always leave it to the next filter.
-  void Deliver(const char* interface, const char* member, int type1, const void* arg1,
-               int type2 = DBUS_TYPE_INVALID, const void* arg2 = nullptr,
-               const char* sender = ":1.7") {
-    DBusMessage* msg = dbus_message_new_signal("/Org/Tizen/System/Crash/Crash", interface, member);
+  void Deliver(const char* member, const char* exe, const char* sender = ":1.7",
+               bool intArg = false) {
+    const char* iface = "org.tizen.system.crash.Crash";
+    DBusMessage* msg = dbus_message_new_signal("/Org/Tizen/System/Crash/Crash", iface, member);
     ASSERT_NE(msg, nullptr);
     if (sender != nullptr) {
       ASSERT_TRUE(dbus_message_set_sender(msg, sender));
     }
-    if (type1 != DBUS_TYPE_INVALID) {
-      ASSERT_TRUE(dbus_message_append_args(msg, type1, arg1, type2, arg2, DBUS_TYPE_INVALID));
-    }
+    const char* name = "proc";
+    dbus_int32_t number = 7;
+    ASSERT_TRUE(intArg ? dbus_message_append_args(msg, DBUS_TYPE_STRING, &name, DBUS_TYPE_INT32,
+                                                  &number, DBUS_TYPE_INVALID)
+                       : dbus_message_append_args(msg, DBUS_TYPE_STRING, &name, DBUS_TYPE_STRING,
+                                                  &exe, DBUS_TYPE_INVALID));
     EXPECT_EQ(CrashMonitor::CrashFilter(nullptr, msg, &monitor),
               DBUS_HANDLER_RESULT_NOT_YET_HANDLED);
     dbus_message_unref(msg);
-  }
-  void Crash(const char* exe, const char* sender = ":1.7") {
-    const char* name = "proc";
-    Deliver(kIface, "ProcessCrashed", DBUS_TYPE_STRING, &name, DBUS_TYPE_STRING, &exe, sender);
   }
   std::string Errors() {
     return Rows("SELECT app_id, type FROM report_app_error_survey ORDER BY _id");
   }
 
-  static constexpr const char* kIface = "org.tizen.system.crash.Crash";
   CrashMonitor monitor{ProviderRegistry::GetInstance()};
 };
 
-// Malformed signals and unknown executables also run through the daemon in the system tests.
-TEST_F(CrashMonitorTest, IgnoresOtherSignalsAndUnreadableAppData) {
-  Install("com.ex.app", "pkg.app", "/usr/apps/app/bin/app");
+TEST_F(CrashMonitorTest, OnlyCrashesReportedByATrustedSenderAreWritten) {
   const char* exe = "/usr/apps/app/bin/app";
-  const char* name = "app";
-  dbus_int32_t number = 7;
-  Deliver(kIface, "ProcessStarted", DBUS_TYPE_STRING, &name, DBUS_TYPE_STRING, &exe);
-  Deliver(kIface, "ProcessCrashed", DBUS_TYPE_STRING, &name, DBUS_TYPE_INT32, &number);
-  ASSERT_EQ(Sh("echo garbage > '" + sysroot + "/opt/dbspace/.pkgmgr_parser.db'"), 0);
-  Crash(exe);
+  Install("com.ex.app", "pkg.app", exe);
+  for (const char* sender : {":1.9", ":1.404", "com.example.name", (const char*)nullptr}) {
+    SCOPED_TRACE(sender != nullptr ? sender : "no sender");
+    Deliver("ProcessCrashed", exe, sender);
+  }
+  Deliver("ProcessStarted", exe);
+  Deliver("ProcessCrashed", exe, ":1.7", true);
   EXPECT_EQ(Errors(), "");
+  Deliver("ProcessCrashed", exe);
+  EXPECT_EQ(Errors(), "com.ex.app:1;");
+  ASSERT_EQ(Sh("echo garbage > '" + sysroot + "/opt/dbspace/.pkgmgr_parser.db'"), 0);
+  Deliver("ProcessCrashed", exe);
+  EXPECT_EQ(Errors(), "com.ex.app:1;");
 }
 
 TEST_F(CrashMonitorTest, StoresAppIdsVerbatimAndRefusesOnesThatDoNotFit) {
@@ -72,7 +76,7 @@ TEST_F(CrashMonitorTest, StoresAppIdsVerbatimAndRefusesOnesThatDoNotFit) {
     SCOPED_TRACE(id.size());
     std::string exe = "/usr/apps/x" + std::to_string(id.size()) + id.substr(0, 1);
     Install(id, "pkg.x", exe);
-    Crash(exe.c_str());
+    Deliver("ProcessCrashed", exe.c_str());
   }
   EXPECT_EQ(Errors(), quoted + ":1;" + fits + ":1;");
 }

@@ -1,6 +1,5 @@
-// Host aul and pkgmgr-info over the app database they keep open: answers follow the file when it
-// is replaced or written in place, in either journal mode, and agree with and without the
-// app_exec index. This test process itself is the app being looked up.
+// Host aul and pkgmgr-info over the app database they keep open. This test process itself is
+// the app being looked up.
 #include <aul.h>
 #include <gtest/gtest.h>
 #include <limits.h>
@@ -30,21 +29,18 @@ class AppDbTest : public ::testing::Test {
     return sqlite3_exec(conn, sql.c_str(), nullptr, nullptr, nullptr);
   }
 
-  // A new database at |path|, rollback journal, holding this process as |app| of |package|.
+  // A new database at |path|, holding this process as |app| of |package|.
   void Create(const std::string& path, const std::string& app, const std::string& package,
               bool index = false) {
     sqlite3* conn = nullptr;
     ASSERT_EQ(sqlite3_open(path.c_str(), &conn), SQLITE_OK);
-    ASSERT_EQ(Exec(conn,
-                   "CREATE TABLE package_app_info(app_id TEXT PRIMARY KEY, package TEXT NOT "
-                   "NULL, app_exec TEXT NOT NULL)"),
-              SQLITE_OK);
-    if (index) {
-      ASSERT_EQ(Exec(conn, "CREATE INDEX package_app_info_exec ON package_app_info(app_exec)"),
-                SQLITE_OK);
-    }
-    ASSERT_EQ(Exec(conn, "INSERT INTO package_app_info VALUES ('" + app + "','" + package + "','" +
-                             self + "')"),
+    ASSERT_EQ(Exec(conn, std::string("CREATE TABLE package_app_info(app_id TEXT PRIMARY KEY, "
+                                     "package TEXT NOT NULL, app_exec TEXT NOT NULL);") +
+                             (index ? "CREATE INDEX package_app_info_exec ON "
+                                      "package_app_info(app_exec);"
+                                    : "") +
+                             "INSERT INTO package_app_info VALUES ('" + app + "','" + package +
+                             "','" + self + "')"),
               SQLITE_OK);
     sqlite3_close(conn);
   }

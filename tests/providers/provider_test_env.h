@@ -39,16 +39,8 @@ inline bool MatchesWithNumbers(const std::string& text, const std::string& patte
   return t == text.size();
 }
 
-// A started statement's text with its bound values written in as literals: what a kept
-// statement runs reads as the text statement it stands for.
-inline std::string ExpandedText(void* stmt) {
-  char* text = sqlite3_expanded_sql(static_cast<sqlite3_stmt*>(stmt));
-  std::string out = text != nullptr ? text : "";
-  sqlite3_free(text);
-  return out;
-}
-
-// Statements as SQLite starts them, minus the test's own queries.
+// Statements as SQLite starts them, bound values written in as literals (a kept statement reads
+// as the text it stands for), minus the test's own queries.
 struct StatementTrace {
   void Attach(DbConnection* conn) {
     sqlite3_trace_v2(conn->Handle(), SQLITE_TRACE_STMT, &StatementTrace::OnStatement, this);
@@ -56,7 +48,10 @@ struct StatementTrace {
   std::vector<std::string> Take() { return std::move(statements); }
   static int OnStatement(unsigned, void* self, void* stmt, void*) {
     StatementTrace* trace = static_cast<StatementTrace*>(self);
-    if (!trace->paused) trace->statements.push_back(ExpandedText(stmt));
+    if (trace->paused) return 0;
+    char* text = sqlite3_expanded_sql(static_cast<sqlite3_stmt*>(stmt));
+    trace->statements.push_back(text != nullptr ? text : "");
+    sqlite3_free(text);
     return 0;
   }
   std::vector<std::string> statements;

@@ -26,44 +26,31 @@ struct FakeBus {
 };
 
 TEST(SenderUidCacheTest, AsksOncePerNameKeepsOnlyAnswersAndForgetsTheOldestFirst) {
-  FakeBus bus;
-  bus.owners = {{":1.1", 5000}, {":1.2", 0}, {":1.3", 200}, {"com.example.well", 0}};
+  FakeBus bus{{{":1.1", 5000}, {":1.2", 0}, {"com.example.well", 0}}, {}};
   SenderUidCache cache(2);
-  uid_t uid = 99;
-  EXPECT_FALSE(cache.UidOf("com.example.well", FakeBus::Lookup, &bus, &uid));
-  EXPECT_FALSE(cache.UidOf(nullptr, FakeBus::Lookup, &bus, &uid));
+  auto uidOf = [&](const char* name, FakeBus* on) {
+    uid_t uid = 99;
+    return cache.UidOf(name, FakeBus::Lookup, on, &uid) ? static_cast<long>(uid) : -1L;
+  };
+  EXPECT_EQ(uidOf("com.example.well", &bus), -1);
+  EXPECT_EQ(uidOf(nullptr, &bus), -1);
   EXPECT_TRUE(bus.asked.empty()) << "only unique names are asked about";
-
-  for (int i = 0; i < 3; ++i) {
-    ASSERT_TRUE(cache.UidOf(":1.1", FakeBus::Lookup, &bus, &uid));
-    EXPECT_EQ(uid, 5000u);
-  }
+  for (int i = 0; i < 3; ++i) EXPECT_EQ(uidOf(":1.1", &bus), 5000);
   EXPECT_EQ(bus.asked, std::vector<std::string>{":1.1"});
-
   // A name the bus cannot tell about (gone, or an error) is asked again next time.
-  EXPECT_FALSE(cache.UidOf(":1.9", FakeBus::Lookup, &bus, &uid));
+  EXPECT_EQ(uidOf(":1.9", &bus), -1);
   bus.owners[":1.9"] = 7;
-  ASSERT_TRUE(cache.UidOf(":1.9", FakeBus::Lookup, &bus, &uid));
-  EXPECT_EQ(uid, 7u);
-  EXPECT_EQ(cache.Size(), 2u);
-
+  EXPECT_EQ(uidOf(":1.9", &bus), 7);
   // Full: the oldest (:1.1) goes, the newer ones stay without a question.
-  ASSERT_TRUE(cache.UidOf(":1.2", FakeBus::Lookup, &bus, &uid));
-  EXPECT_EQ(uid, 0u);
+  EXPECT_EQ(uidOf(":1.2", &bus), 0);
   EXPECT_EQ(cache.Size(), 2u);
   bus.asked.clear();
-  ASSERT_TRUE(cache.UidOf(":1.9", FakeBus::Lookup, &bus, &uid));
-  ASSERT_TRUE(cache.UidOf(":1.2", FakeBus::Lookup, &bus, &uid));
-  EXPECT_TRUE(bus.asked.empty());
-  ASSERT_TRUE(cache.UidOf(":1.1", FakeBus::Lookup, &bus, &uid));
+  EXPECT_EQ(uidOf(":1.9", &bus) + uidOf(":1.2", &bus) + uidOf(":1.1", &bus), 5007);
   EXPECT_EQ(bus.asked, std::vector<std::string>{":1.1"});
-
   // Another bus hands out the same names afresh: nothing kept for the first one answers there.
-  FakeBus other;
-  other.owners = {{":1.1", 300}};
-  ASSERT_TRUE(cache.UidOf(":1.1", FakeBus::Lookup, &other, &uid));
-  EXPECT_EQ(uid, 300u);
-  EXPECT_FALSE(cache.UidOf(":1.2", FakeBus::Lookup, &other, &uid));
+  FakeBus other{{{":1.1", 300}}, {}};
+  EXPECT_EQ(uidOf(":1.1", &other), 300);
+  EXPECT_EQ(uidOf(":1.2", &other), -1);
 }
 
 }  // namespace

@@ -1,12 +1,11 @@
-// Fixture of the reporting tests: the provider fixture's real database files, registry and
-// managers, a fixed time zone and an injectable clock.
+// Reporting fixture: the provider fixture's database files, registry and managers, a fixed time
+// zone, the files the record header reads and an injectable clock.
 #ifndef LOGMGR_TESTS_REPORTING_REPORTING_TEST_ENV_H_
 #define LOGMGR_TESTS_REPORTING_REPORTING_TEST_ENV_H_
 
 #include <gtest/gtest.h>
 #include <sqlite3.h>
 #include <stdlib.h>
-#include <sys/stat.h>
 #include <time.h>
 
 #include <fstream>
@@ -23,14 +22,12 @@ inline int64_t g_testNowMs = 0;
 inline int64_t TestClock() { return g_testNowMs; }
 inline bool TestReportEnabled() { return true; }
 
-// The provider fixture's sysroot, registry and managers, with the files the record header reads
-// and the preference store.
 class ReportingTest : public ProviderTest {
  protected:
   void SetUp() override {
     setenv("TZ", "Europe/Berlin", 1);
     tzset();
-    // No telephony service: the operator codes stay unknown unless a test brings a bus.
+    // No telephony service: the operator codes stay unknown.
     setenv("DBUS_SYSTEM_BUS_ADDRESS", "unix:path=/nonexistent/bus", 1);
     ProviderTest::SetUp();
     WriteFile("/etc/os-release", "NAME=\"Test OS\"\nVERSION_ID=\"12\"\nBUILD_ID=W2.3-K9\n");
@@ -38,13 +35,11 @@ class ReportingTest : public ProviderTest {
     StartProviders();
     ASSERT_EQ(prefs.Create(), 0);
   }
-
   void TearDown() override {
     (void)prefs.Close();
     ProviderTest::TearDown();
   }
 
-  // What the daemon hands the report run, with the test clock.
   ReportContext Context() {
     ReportContext context;
     context.prefs = &prefs;
@@ -66,7 +61,6 @@ class ReportingTest : public ProviderTest {
     for (std::string line; std::getline(in, line);) lines.push_back(line);
     return lines;
   }
-
   // Local time of a calendar date in the fixed zone, in ms.
   static int64_t LocalMs(int year, int month, int day, int hour = 0, int minute = 0, int second = 0,
                          int ms = 0) {
@@ -80,11 +74,9 @@ class ReportingTest : public ProviderTest {
     tm.tm_isdst = -1;
     return static_cast<int64_t>(mktime(&tm)) * 1000 + ms;
   }
-
   void Exec(DbConnection* conn, const std::string& sql) {
-    char* error = nullptr;
-    ASSERT_EQ(sqlite3_exec(conn->Handle(), sql.c_str(), nullptr, nullptr, &error), SQLITE_OK)
-        << sql << ": " << (error ? error : "");
+    ASSERT_EQ(sqlite3_exec(conn->Handle(), sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK)
+        << sql;
   }
   // Column 0 of every row, as text.
   std::vector<std::string> Column(DbConnection* conn, const std::string& sql) {

@@ -2,9 +2,6 @@
 #include "storage/status_snapshot_store.h"
 
 #include <gtest/gtest.h>
-#include <sqlite3.h>
-#include <stdlib.h>
-#include <sys/stat.h>
 
 #include <string>
 
@@ -17,41 +14,48 @@ namespace {
 class StatusSnapshotStoreTest : public ::testing::Test {
  protected:
   void TearDown() override { StatusSnapshotStore::DestroyInstance(); }
-  StatusSnapshotStore* Open() {
-    (void)tmp.MakeDir("/opt/usr/dbspace");
-    return StatusSnapshotStore::GetInstance();
+  // Get's answer as "result:extra:timestamp".
+  std::string Got(StatusSnapshotStore* store, const char* feature) {
+    std::string extra = "kept";
+    int64_t ts = 7;
+    int result = store->Get(feature, &extra, &ts);
+    return std::to_string(result) + ":" + extra + ":" + std::to_string(ts);
   }
-  // Rows as stored, read past the store: "feature|extra|timestamp;" each.
+  // Rows as stored, read past the store.
   std::string Dump() {
-    return FileRows(sysroot + "/opt/usr/dbspace/.StatusMonitor.db",
+    return FileRows(tmp.Path("/opt/usr/dbspace/.StatusMonitor.db"),
                     "SELECT feature, extra, timestamp FROM survey_status_monitor ORDER BY feature",
                     "|");
   }
   TempSysroot tmp{"snapshot"};
-  const std::string sysroot = tmp.path();
 };
 
-TEST_F(StatusSnapshotStoreTest, RejectsWhatTheStatementCannotCarry) {
-  StatusSnapshotStore* store = Open();
+TEST_F(StatusSnapshotStoreTest, KeepsOneRowPerFeatureAndStoresTextsAsTheyCame) {
+  ASSERT_TRUE(tmp.MakeDir("/opt/usr/dbspace"));
+  StatusSnapshotStore* store = StatusSnapshotStore::GetInstance();
   ASSERT_NE(store, nullptr);
-  ASSERT_EQ(store->Put("HEAD", "", 42), 0);
-  std::string extra = "kept";
-  int64_t ts = 7;
-  EXPECT_EQ(store->Put("", "x", 1), -1);
-  EXPECT_EQ(store->Get("", &extra, &ts), -1);
-  EXPECT_EQ(extra, "kept");
-  EXPECT_EQ(ts, 7);
-  // A quote is stored as it came; a feature or extra too long for its literal is refused.
-  EXPECT_EQ(store->Put("HEAD", "it's'); DROP TABLE survey_status_monitor; --", 99), 0);
-  EXPECT_EQ(Dump(), "HEAD|it's'); DROP TABLE survey_status_monitor; --|99;");
-  EXPECT_EQ(store->Put("HEAD", std::string(600, 'x').c_str(), 1), -1);
-  ASSERT_EQ(store->Put("HEAD", "", 42), 0);
+  EXPECT_EQ(Got(store, "SCRN"), "0::0");
+  ASSERT_EQ(store->Put("BLUE", "1025", 1700000000123LL), 0);
+  ASSERT_EQ(store->Put("BLUE", "515", 1700000000999LL), 0);
+  ASSERT_EQ(store->Put("SCRN", "", 1700000000500LL), 0);
+  EXPECT_EQ(Dump(), "BLUE|515|1700000000999;SCRN||1700000000500;");
+  EXPECT_EQ(Got(store, "BLUE"), "0:515:1700000000999");
+  EXPECT_EQ(store->LatestTimestamp(), 1700000000999LL);
+  // Closing a period is a write of "" and 0.
+  ASSERT_EQ(store->Put("BLUE", "", 0), 0);
+  EXPECT_EQ(Got(store, "BLUE"), "0::0");
+  EXPECT_EQ(store->LatestTimestamp(), 1700000000500LL);
 
+  EXPECT_EQ(store->Put("", "x", 1), -1);
+  EXPECT_EQ(Got(store, ""), "-1:kept:7");
+  // A quote is stored as it came; an extra too long for its literal is refused.
+  EXPECT_EQ(store->Put("HEAD", "it's'); DROP TABLE survey_status_monitor; --", 99), 0);
+  EXPECT_EQ(store->Put("HEAD", std::string(600, 'x').c_str(), 1), -1);
+  EXPECT_EQ(Dump(),
+            "BLUE||0;HEAD|it's'); DROP TABLE survey_status_monitor; --|99;SCRN||1700000000500;");
   // No escaping: an extra with a comma reads back cut, the next field as the timestamp.
   ASSERT_EQ(store->Put("CHAR", "U,12,x", 500), 0);
-  ASSERT_EQ(store->Get("CHAR", &extra, &ts), 0);
-  EXPECT_EQ(extra, "U");
-  EXPECT_EQ(ts, 12);
+  EXPECT_EQ(Got(store, "CHAR"), "0:U:12");
 }
 
 TEST_F(StatusSnapshotStoreTest, StaysRegisteredWhenTheFileCannotBeOpened) {
@@ -59,10 +63,8 @@ TEST_F(StatusSnapshotStoreTest, StaysRegisteredWhenTheFileCannotBeOpened) {
   EXPECT_EQ(StatusSnapshotStore::GetInstance(), nullptr);
   StatusSnapshotStore* again = StatusSnapshotStore::GetInstance();
   ASSERT_NE(again, nullptr);
-  std::string extra;
-  int64_t ts = 0;
   EXPECT_EQ(again->Put("SCRN", "", 1), -1);
-  EXPECT_EQ(again->Get("SCRN", &extra, &ts), -1);
+  EXPECT_EQ(Got(again, "SCRN"), "-1:kept:7");
   EXPECT_EQ(again->LatestTimestamp(), 0);
 }
 

@@ -48,31 +48,25 @@ def root_watched(display_name):
         d.close()
 
 
-def in_front_at_known_time(dev, clock, app, gamma, gamma_package):
-    """Brings |gamma| to the front and then |app| until the daemon shows it took both in step
-    with the clock (a row of |gamma| of exactly this probe's length): |app|'s period then starts
-    now. Returns the rows of |gamma_package| so far."""
+def front_at_known_time(dev, clock, gamma_rows, app):
+    """Brings gamma and then |app| to the front until a gamma row of exactly this probe's
+    length shows the daemon took both in step with the frozen clock."""
     attempts = []
 
-    def rows():
-        return dev.query(".SurveyLog.db", "SELECT app_id, duration FROM use_app_survey WHERE "
-                         "app_id = ? ORDER BY _id", (gamma_package,))
-
     def probe():
-        # Each probe steps the clock by its own length, so a late row of an earlier probe never
-        # passes for this one; X events are handled in order, so nothing is pending after it.
+        # Each probe has its own length, so a late row of an earlier probe never passes for
+        # this one; X events are handled in order, so this row being last means none is pending.
         attempts.append(1000 + len(attempts))
-        count = len(rows())
-        dev.devsim("app", "focus", gamma)
+        count = len(gamma_rows())
+        dev.devsim("app", "focus", GAMMA)
         clock.advance_ms(attempts[-1])
         dev.devsim("app", "focus", app)
         try:
-            new = wait_for(lambda: rows()[count:], timeout=10)
+            rows = wait_for(lambda: gamma_rows()[count:], timeout=10)
         except AssertionError:
             return False
-        return new[-1][1] == attempts[-1]
+        return rows[-1][-1] == attempts[-1]
     wait_for(probe, timeout=60, interval=0, message="the daemon to follow the windows")
-    return rows()
 
 
 class AppCase(DeviceTestCase):
@@ -113,11 +107,13 @@ class AppCase(DeviceTestCase):
         return [r for r in rows if package is None or r[0] == package]
 
     def in_front_at_known_time(self, app):
+        """Returns the gamma rows written so far; |app|'s period starts now."""
         if GAMMA not in self.pids:
             self.dev.devsim("app", "install", GAMMA)
             self.pids[GAMMA] = int(self.dev.devsim("app", "launch", GAMMA).stdout)
             self.addCleanup(self.dev.devsim, "app", "kill", GAMMA, check=False)
-        return in_front_at_known_time(self.dev, self.clock, app, GAMMA, GAMMA)
+        front_at_known_time(self.dev, self.clock, lambda: self.periods(GAMMA), app)
+        return self.periods(GAMMA)
 
     def aul(self, member, *args):
         self.dev.dbus_send("--type=signal", AUL[0], f"{AUL[1]}.{member}", *args)
@@ -125,7 +121,10 @@ class AppCase(DeviceTestCase):
 
 class AppUsageTest(AppCase):
 
-    def test_bad_input_is_skipped_and_later_events_still_count(self):
+    def test_bad_input_lock_screen_and_screen_off(self):
+        def step(count, message):
+            wait_for(lambda: len(self.periods()) == count, message=message)
+
         self.focus(BETA)
         self.aul("app_launch", "string:123")
         self.aul("app_dead", "int32:5")
@@ -134,18 +133,29 @@ class AppUsageTest(AppCase):
         self.aul("app_dead", f"uint32:{os.getpid()}")
         self.focus(ALPHA, "--no-pid")  # a window of no process: beta's period runs on
         self.focus(ALPHA)
+        step(1, "beta's period")
+        self.focus(LOCK)  # ends alpha's period and starts none
+        step(2, "alpha's period at the lock screen")
         self.focus(BETA)
-        wait_for(lambda: len(self.periods()) == 2, message="two periods")
-        self.assertEqual([r[0] for r in self.periods()], ["pkg.beta", "pkg.alpha"])
+        self.focus(ALPHA)
+        step(3, "beta's period")
+        self.dev.devsim("screen", "off")
+        step(4, "alpha's period at screen off")
+        self.focus(BETA)  # while the screen is off: no period for anyone
+        self.dev.devsim("screen", "on")
+        self.focus(ALPHA)
+        step(5, "beta's period from screen on")
+        self.assertEqual([r[0] for r in self.periods()],
+                         ["pkg.beta", "pkg.alpha", "pkg.beta", "pkg.alpha", "pkg.beta"])
         self.assertIsNone(self.dev.daemon.poll())
 
 
 class FrozenClockTest(AppCase):
-    """Periods measured on the daemon's own clock, which moves only when the test moves it, so
-    the lengths are exact however slowly the machine runs."""
+    """On the daemon's own clock, which moves only when the test moves it, lengths are exact
+    however slowly the machine runs."""
     FROZEN = True
 
-    def test_five_seconds_in_front_make_one_row_of_5000_ms(self):
+    def test_period_lengths_and_deaths_from_150_ms_into_a_period(self):
         self.in_front_at_known_time(ALPHA)
         before = len(self.periods("pkg.alpha"))
         self.clock.advance_ms(5000)
@@ -153,15 +163,15 @@ class FrozenClockTest(AppCase):
         rows = wait_for(lambda: self.periods("pkg.alpha")[before:], message="alpha's period")
         self.assertEqual(rows, [("pkg.alpha", 5000)])
 
-    def test_deaths_count_only_from_150_ms_into_a_period(self):
         gammas = self.in_front_at_known_time(ALPHA)
+        betas = len(self.periods("pkg.beta"))
         self.clock.advance_ms(149)
         self.dev.devsim("app", "kill", GAMMA)
         self.clock.advance_ms(1851)
         self.dev.devsim("app", "kill", BETA)  # in the background, still counted
-        wait_for(lambda: self.periods("pkg.beta"), message="beta's row")
+        rows = wait_for(lambda: self.periods("pkg.beta")[betas:], message="beta's row")
         self.assertEqual(self.periods(GAMMA), gammas)  # its death came too early to count
-        self.assertEqual(self.periods("pkg.beta"), [("pkg.beta", 2000)])
+        self.assertEqual(rows, [("pkg.beta", 2000)])
 
 
 if __name__ == "__main__":

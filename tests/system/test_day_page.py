@@ -1,19 +1,17 @@
 """The day page (logmgrctl day) of a day driven through the real daemon on a frozen clock in
-Seoul: its lanes, bars and records read back from the HTML, and the page in headless Chromium."""
+Seoul: its lanes, bars and records read back from the HTML."""
 import html.parser
 import os
 import shutil
 import sqlite3
-import struct
 import subprocess
 import tempfile
 import time
 import unittest
-import zlib
 from unittest import mock
 
 from harness import DBSPACE, Device, wait_for
-from test_app_usage import MsClock, in_front_at_known_time, root_watched
+from test_app_usage import MsClock, front_at_known_time, root_watched
 
 ZONE = "Asia/Seoul"
 DAY = "2026-03-10"  # the clock starts at 19:00 there
@@ -30,21 +28,19 @@ class Page(html.parser.HTMLParser):
     def __init__(self, text):
         super().__init__()
         self.lanes, self.fg, self.rows, self.texts = {}, {}, {}, []
-        self.scripts, self.root = 0, {}
+        self.scripts = 0  # script and img elements: the page's one script, nothing injected
         self.lane = self.section = self.row = self.key = None
         self.feed(text)
 
     def handle_starttag(self, tag, attrs):
         a = dict(attrs)
-        if tag == "html":
-            self.root = a
-        if tag == "script":
+        if tag in ("script", "img"):
             self.scripts += 1
         if tag == "section":
             self.section = a.get("id")
             self.rows.setdefault(self.section, [])
         if "data-lane" in a:
-            self.lane = self.lanes.setdefault(a["data-lane"], {"kind": a["data-kind"], "items": []})
+            self.lane = self.lanes.setdefault(a["data-lane"], {"items": []})
         if tag == "rect" and ("bar" in a.get("class", "") or "mark" in a.get("class", "")):
             self.lane["items"].append(a)
         if "data-app" in a:
@@ -65,54 +61,17 @@ class Page(html.parser.HTMLParser):
         return [b for b in self.lanes[lane]["items"] if "bar" in b["class"]]
 
 
-def png_pixels(path):
-    """(width, height, rows of RGB tuples) of an 8-bit RGB or RGBA PNG."""
-    with open(path, "rb") as f:
-        data = f.read()
-    pos, idat = 8, b""
-    while pos < len(data):
-        length, kind = struct.unpack(">I4s", data[pos:pos + 8])
-        chunk = data[pos + 8:pos + 8 + length]
-        if kind == b"IHDR":
-            width, height, depth, color = struct.unpack(">IIBB", chunk[:10])
-        elif kind == b"IDAT":
-            idat += chunk
-        pos += 12 + length
-    assert depth == 8 and color in (2, 6), (depth, color)
-    bpp = 3 if color == 2 else 4
-    raw, stride, prev, rows = zlib.decompress(idat), width * bpp, bytearray(width * bpp), []
-    for y in range(height):
-        start = y * (stride + 1)
-        kind, line = raw[start], bytearray(raw[start + 1:start + 1 + stride])
-        for i in range(stride):
-            left = line[i - bpp] if i >= bpp else 0
-            up, corner = prev[i], prev[i - bpp] if i >= bpp else 0
-            if kind == 1:
-                line[i] = (line[i] + left) & 255
-            elif kind == 2:
-                line[i] = (line[i] + up) & 255
-            elif kind == 3:
-                line[i] = (line[i] + (left + up) // 2) & 255
-            elif kind == 4:
-                p = left + up - corner
-                pa, pb, pc = abs(p - left), abs(p - up), abs(p - corner)
-                pred = left if pa <= pb and pa <= pc else up if pb <= pc else corner
-                line[i] = (line[i] + pred) & 255
-        rows.append([tuple(line[x:x + 3]) for x in range(0, stride, bpp)])
-        prev = line
-    return width, height, rows
-
-
 class DayPageTest(unittest.TestCase):
     """One day is driven once; the tests read the two pages it gave."""
 
     @classmethod
     def setUpClass(cls):
         env = mock.patch.dict(os.environ, {"TZ": ZONE, "LOGMGR_ZONE": ZONE})
+        # Cleanups run last first: the zone is re-read after the environment is restored.
+        cls.addClassCleanup(time.tzset)
         env.start()
         cls.addClassCleanup(env.stop)
         time.tzset()
-        cls.addClassCleanup(time.tzset)
         cls.dev = dev = Device(with_x=True)
         cls.addClassCleanup(dev.close)
         cls.out = tempfile.mkdtemp(prefix="logmgr-day-")
@@ -148,7 +107,8 @@ class DayPageTest(unittest.TestCase):
                  and root_watched(dev.env["DISPLAY"]), timeout=30, interval=0.2,
                  message="the daemon to watch the root window")
 
-        in_front_at_known_time(dev, clock, "com.ex.alpha", "com.ex.gamma", "pkg.gamma")
+        gamma = "SELECT duration FROM use_app_survey WHERE app_id='pkg.gamma' ORDER BY _id"
+        front_at_known_time(dev, clock, lambda: cls.rows(gamma), "com.ex.alpha")
         cls.alpha_from = clock.now_ms
         for app, ms in (("com.ex.beta", 300000), ("com.corvane.lockscreen", 180000)):
             clock.advance_ms(ms)
@@ -236,11 +196,6 @@ class DayPageTest(unittest.TestCase):
         self.assertIn("180000", [b["data-ms"] for b in page.bars("pkg.beta")])
         for code, ms in (("CHAR", 600000), ("HEAD", 120000), ("WIFI", 60000), ("SCRN", 240000)):
             self.assertIn(str(ms), [b["data-ms"] for b in page.bars(code)], code)
-        # Bars are as wide as their time in the window (1000 units across).
-        start, end = (int(v) for v in self.window(self.before[0]))
-        for bar in alpha:
-            self.assertAlmostEqual(float(bar["width"]),
-                                   max(3.0, int(bar["data-shown-ms"]) * 1000 / (end - start)), 1)
         opened = [b for b in page.bars("SCRN") if "open" in b["class"]]
         self.assertEqual([b["data-start"] for b in opened],
                          [self.clock_text(self.screen_open_from)])
@@ -257,13 +212,6 @@ class DayPageTest(unittest.TestCase):
         # Foreground time per app: largest first, the rows' sums.
         self.assertEqual({k: v for k, v in page.fg.items() if k != HOSTILE}, self.sums)
         self.assertEqual(list(page.fg.values()), sorted(page.fg.values(), reverse=True))
-
-    def window(self, path):
-        with open(path) as f:
-            text = f.read()
-        tag = text[text.index("<section id=\"timeline\""):].split(">", 1)[0]
-        return [tag.split(f'{k}="')[1].split('"')[0]
-                for k in ("data-window-start", "data-window-end")]
 
     def test_relay_records_and_queue_after_the_report_run(self):
         page = self.after[1]
@@ -294,29 +242,17 @@ class DayPageTest(unittest.TestCase):
         bad = self.dev.run_tool("logmgrctl", "day", "2026-02-30", check=False)
         self.assertEqual((bad.returncode, bad.stderr.count("\n")), (2, 1))
 
+
     @unittest.skipUnless(os.path.exists(CHROMIUM), "needs /usr/bin/chromium (scripts/deps --full)")
-    def test_page_renders_in_chromium_without_script_errors(self):
-        path = self.before[0]
+    def test_page_runs_in_chromium_without_script_errors_or_injected_markup(self):
         profile = tempfile.mkdtemp(prefix="chromium-", dir=self.out)
-        base = [CHROMIUM, "--headless", "--no-sandbox", "--disable-gpu", "--hide-scrollbars",
-                f"--user-data-dir={profile}", "--enable-logging=stderr", "--v=0"]
-        dom = subprocess.run(base + ["--dump-dom", f"file://{path}"], capture_output=True,
-                             text=True, timeout=120)
+        dom = subprocess.run([CHROMIUM, "--headless", "--no-sandbox", "--disable-gpu",
+                              f"--user-data-dir={profile}", "--enable-logging=stderr", "--v=0",
+                              "--dump-dom", f"file://{self.before[0]}"],
+                             capture_output=True, text=True, timeout=120)
         self.assertIn('data-ready="1"', dom.stdout.split(">", 2)[1])
         self.assertNotIn("data-owned", dom.stdout.split("<body", 1)[0])
         self.assertNotIn("Uncaught", dom.stderr)
-        shot = os.path.join(self.out, "phone.png")
-        subprocess.run(base + [f"--screenshot={shot}", "--window-size=1280,1400", f"file://{path}"],
-                       capture_output=True, timeout=120)
-        width, height, rows = png_pixels(shot)
-        self.assertEqual(width, 1280)
-        colors = {}
-        for row in rows:
-            for px in row:
-                colors[px] = colors.get(px, 0) + 1
-        # Screen, charger and the first app's bars are painted in their colours.
-        for rgb in ((0xe0, 0xa5, 0x26), (0x59, 0xa1, 0x4f), (0x4e, 0x79, 0xa7)):
-            self.assertGreater(colors.get(rgb, 0), 20, rgb)
 
 
 if __name__ == "__main__":

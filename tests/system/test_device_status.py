@@ -1,7 +1,8 @@
-"""Device status through the real daemon: periods, battery, events, Bluetooth, restarts. Where a
-duration is checked the daemon's clock stands still between steps, so durations are exact."""
+"""Device status features through the real daemon: periods, battery, events, Bluetooth, restarts.
+Wherever a duration is checked the daemon runs on a frozen clock, so durations are exact."""
 import os
 import signal
+import sqlite3
 import subprocess
 
 import dbus
@@ -12,17 +13,6 @@ from test_app_usage import MsClock
 FEATURE_DB = ".SurveyLog.db"
 SNAPSHOT_DB = ".StatusMonitor.db"
 APP_ID = "com.corvane.logmanager"
-
-
-class FrozenClock(MsClock):
-    def __init__(self, dev, start=1773136800):
-        super().__init__(dev, start * 1000)
-
-    def advance(self, seconds):
-        self.advance_ms(seconds * 1000)
-
-    def ms(self):
-        return self.now_ms
 
 
 class DeviceStatusCase(DeviceTestCase):
@@ -37,7 +27,9 @@ class DeviceStatusCase(DeviceTestCase):
         return proc
 
     def wait_monitoring(self):
-        # An UNLO row shows the handlers registered (recovery writes rows before they are).
+        """Unlocks until an UNLO row shows every handler is registered; later rows are new."""
+        # Only an UNLO row counts: the restart recovery writes rows of its own before the
+        # handlers are registered.
         def probe():
             before = self.max_id("UNLO")
             self.dev.devsim("unlock")
@@ -50,8 +42,11 @@ class DeviceStatusCase(DeviceTestCase):
 
     def max_id(self, feature=None):
         where = " WHERE feature = ?" if feature else ""
-        rows = self.dev.query(FEATURE_DB, "SELECT MAX(_id) FROM use_app_feature_survey" + where,
-                              (feature,) if feature else ())
+        try:
+            rows = self.dev.query(FEATURE_DB, "SELECT MAX(_id) FROM use_app_feature_survey" + where,
+                                  (feature,) if feature else ())
+        except sqlite3.OperationalError:  # the table is not created yet
+            return 0
         return (rows[0][0] or 0) if rows else 0
 
     def rows(self, *features):
@@ -66,6 +61,7 @@ class DeviceStatusCase(DeviceTestCase):
         return rows[0] if rows else ("", 0)
 
     def vconf_marker(self):
+        """Waits until every vconf change made so far has been handled."""
         count = len(self.rows("UNLO"))
         self.dev.devsim("unlock")
         wait_for(lambda: len(self.rows("UNLO")) > count, message="the unlock marker")
@@ -76,21 +72,23 @@ class DeviceStatusCase(DeviceTestCase):
 
 class ChargerTest(DeviceStatusCase):
     def test_charging_period_with_battery_levels(self):
-        clock = FrozenClock(self.dev)
+        clock = MsClock(self.dev)
         self.start(clock)
         self.dev.devsim("charger", "plug", "usb", "40")
         wait_for(lambda: self.rows("BAT1"), message="BAT1")
-        self.assertEqual(self.snapshot("CHAR"), ("U", clock.ms()))
-        clock.advance(3600)
+        self.assertEqual(self.snapshot("CHAR"), ("U", clock.now_ms))
+        clock.advance_ms(3600000)
         self.dev.devsim("charger", "unplug", "55")
         wait_for(lambda: self.rows("BAT2"), message="BAT2")
         self.assertEqual(self.periods(), [("BAT1", "U", 40000), ("CHAR", "U", 3600000),
                                           ("BAT2", "U", 55000)])
         self.assertEqual(self.snapshot("CHAR"), ("", 0))
-        self.assertEqual(self.dev.query(FEATURE_DB, "SELECT DISTINCT app_id FROM "
-                                        "use_app_feature_survey WHERE _id > ?", (self.base,)),
-                         [(APP_ID,)])
+        rows = self.dev.query(FEATURE_DB, "SELECT app_id FROM use_app_feature_survey "
+                                          "WHERE _id > ?", (self.base,))
+        self.assertEqual({r[0] for r in rows}, {APP_ID})
 
+        # Input that must change nothing: an unplug without a plug, a battery file with text,
+        # a status rewritten as a string, a status value outside 0/1.
         bad = [("unplug without plug", lambda: self.dev.devsim("charger", "unplug", "50")),
                ("battery text", self.plug_with_text_capacity),
                ("string status",
@@ -104,11 +102,12 @@ class ChargerTest(DeviceStatusCase):
                 self.assertEqual(self.snapshot("CHAR"), ("", 0))
 
         # Mains charging carries "A", and charging still works after the bad input.
-        clock.advance(60)
+        clock.advance_ms(60000)
         self.dev.devsim("charger", "plug", "ac", "20")
-        # The plug must be seen before the unplug overwrites the key.
+        # A vconf callback reads the key as it is then: an unplug written before a slow daemon
+        # took the plug would leave it nothing to see.
         wait_for(lambda: len(self.rows("BAT1")) == 2, message="the second plug")
-        clock.advance(60)
+        clock.advance_ms(60000)
         self.dev.devsim("charger", "unplug", "21")
         wait_for(lambda: len(self.periods()) == 6, message="the second charge")
         self.assertEqual(self.periods()[3:], [("BAT1", "A", 20000), ("CHAR", "A", 60000),
@@ -124,10 +123,10 @@ class ChargerTest(DeviceStatusCase):
 
 class PeriodsTest(DeviceStatusCase):
     def test_screen_headset_and_wifi_periods(self):
-        clock = FrozenClock(self.dev)
+        clock = MsClock(self.dev)
         self.dev.vconf_set("memory/pm/state", "int", "1")
         self.start(clock)
-        self.assertEqual(self.snapshot("SCRN"), ("", clock.ms()))
+        self.assertEqual(self.snapshot("SCRN"), ("", clock.now_ms))
 
         steps = [  # (seconds later, key, value)
             (60, "memory/pm/state", 3),      # SCRN 60 s
@@ -144,7 +143,7 @@ class PeriodsTest(DeviceStatusCase):
             (10, "memory/dnet/wifi", 0),     # WIFI 20 s
         ]
         for seconds, key, value in steps:
-            clock.advance(seconds)
+            clock.advance_ms(seconds * 1000)
             self.dev.vconf_set(key, "int", str(value))
             self.vconf_marker()
         self.assertEqual(self.periods(), [("SCRN", "", 60000), ("SCRN", "", 20000),
@@ -243,47 +242,41 @@ class BluetoothTest(DeviceStatusCase):
 
 
 class RestartTest(DeviceStatusCase):
-    def test_crash_closes_at_the_latest_row(self):
-        clock = FrozenClock(self.dev)
+    def test_crash_and_clean_stop_close_the_open_periods(self):
+        clock = MsClock(self.dev)
         self.dev.vconf_set("memory/pm/state", "int", "1")
         first = self.start(clock)
-        self.assertEqual(self.snapshot("SCRN"), ("", clock.ms()))
-        clock.advance(10)
+        self.assertEqual(self.snapshot("SCRN"), ("", clock.now_ms))
+        screen = "SELECT value FROM use_app_feature_survey WHERE feature = 'SCRN' ORDER BY _id"
+        clock.advance_ms(10000)
         self.dev.devsim("capture")
         wait_for(lambda: self.rows("CAPT"), message="CAPT")
 
         # Crash: nothing recorded the stop, so the last row written marks it.
         first.send_signal(signal.SIGKILL)
         self.dev.wait_exit(first)
-        clock.advance(90)
+        clock.advance_ms(90000)
         self.start(clock)
-        self.assertEqual(self.dev.query(FEATURE_DB, "SELECT value FROM use_app_feature_survey "
-                                        "WHERE feature = 'SCRN'"), [(10000,)])
-        self.assertEqual(self.snapshot("SCRN"), ("", clock.ms()))
-
-    def test_clean_stop_closes_at_the_recorded_shutdown_time(self):
-        clock = FrozenClock(self.dev)
-        self.dev.vconf_set("memory/pm/state", "int", "1")
-        self.start(clock)
-        clock.advance(100)
+        self.assertEqual(self.dev.query(FEATURE_DB, screen), [(10000,)])
+        self.assertEqual(self.snapshot("SCRN"), ("", clock.now_ms))
+        clock.advance_ms(100000)
         self.dev.devsim("capture")
         wait_for(lambda: self.rows("CAPT"), message="CAPT")
 
-        # Charger and headset plugged in while the daemon is away; the last row is older.
-        clock.advance(100)
+        # A clean stop, later than the last row; charger and headset plugged in meanwhile.
+        clock.advance_ms(100000)
         self.dev.signal(signal.SIGTERM)
         self.dev.wait_exit()
-        clock.advance(100)
+        clock.advance_ms(100000)
         self.dev.devsim("charger", "plug", "usb", "70")
         self.dev.devsim("earjack", "in")
         self.start(clock)
-        self.assertEqual(self.dev.query(FEATURE_DB, "SELECT value FROM use_app_feature_survey "
-                                        "WHERE feature = 'SCRN' ORDER BY _id"), [(200000,)])
+        self.assertEqual(self.dev.query(FEATURE_DB, screen), [(10000,), (200000,)])
         self.assertEqual(self.dev.query(".pref.db", "SELECT pref_data FROM pref WHERE "
                                         "pref_key = 'key_last_shutdown_time'"), [("0",)])
         # The initial snapshot samples the charger (after its wait) and the headset.
         self.assertEqual(self.dev.query(FEATURE_DB, "SELECT extra, value FROM "
                                         "use_app_feature_survey WHERE feature = 'BAT1'"),
                          [("U", 70000)])
-        self.assertEqual(self.snapshot("CHAR"), ("U", clock.ms()))
-        self.assertEqual(self.snapshot("HEAD"), ("", clock.ms()))
+        self.assertEqual(self.snapshot("CHAR"), ("U", clock.now_ms))
+        self.assertEqual(self.snapshot("HEAD"), ("", clock.now_ms))

@@ -1,5 +1,5 @@
-"""The day cycle through the real daemon: when a report run starts, what it aggregates, and how
-it ends when the daemon is stopped or consent is withdrawn in the middle of it."""
+"""The day cycle through the real daemon: what a report run aggregates, and how it ends when the
+daemon is stopped or consent is withdrawn in the middle of it."""
 import json
 import os
 import signal
@@ -36,8 +36,13 @@ class ReportCycleTest(DeviceTestCase):
         return con
 
     def pref(self, key):
-        value = self.dev.pref(key)
-        return int(value) if value is not None else None
+        rows = self.dev.query(PREF_DB, "SELECT pref_data FROM pref WHERE pref_key=?", (key,))
+        return int(rows[0][0]) if rows else None
+
+    def set_pref(self, key, value):
+        con = self.connect(PREF_DB)
+        con.execute("INSERT OR REPLACE INTO pref VALUES(?,?)", (key, str(value)))
+        con.close()
 
     def outbox(self):
         path = self.dev.path(OUTBOX)
@@ -48,12 +53,13 @@ class ReportCycleTest(DeviceTestCase):
 
     def summaries(self):
         """Dates of the daily size summaries handed to the relay, in order."""
-        out = []
-        for item in self.outbox():
-            if item["4"] == "007":
-                pairs = dict(p.split("=", 1) for p in item["7"].split("¶") if "=" in p)
-                out.append(pairs["date"][:10])
-        return out
+        return [dict(p.split("=", 1) for p in i["7"].split("¶") if "=" in p)["date"][:10]
+                for i in self.outbox() if i["4"] == "007"]
+
+    def handed_over(self, days):
+        wait_for(lambda: self.summaries() == days and self.dev.query(
+            UPLOAD_DB, "SELECT count(*) FROM survey_log") == [(0,)], timeout=30,
+                 message=f"{days} handed over")
 
     def prepared_device(self):
         """Runs the daemon once so its databases exist, then stops it."""
@@ -72,49 +78,9 @@ class ReportCycleTest(DeviceTestCase):
         con.execute("COMMIT")
         con.close()
 
-    def day_text(self, seconds):
+    @staticmethod
+    def day_text(seconds):
         return time.strftime("%Y-%m-%d", time.localtime(seconds))
-
-    def test_ten_days_behind_aggregates_exactly_three_days_oldest_first(self):
-        self.prepared_device()
-        self.dev.set_pref("key_sent_date", midnight(10))
-        for days_ago in (5, 3, 1):
-            self.seed_use_app(midnight(days_ago), 4)
-        self.dev.start_daemon()
-        # The summaries go first: wait for the whole send before reading the day records.
-        wait_for(lambda: len(self.summaries()) == 3 and self.dev.query(
-            UPLOAD_DB, "SELECT count(*) FROM survey_log") == [(0,)], timeout=30,
-                 message="three days handed over")
-        self.assertEqual(self.summaries(), [self.day_text(midnight(d)) for d in (3, 2, 1)])
-        self.assertEqual(self.pref("key_sent_date"), midnight(1))
-        # The day five back was skipped for good; its rows stay until the purge takes them.
-        uses = [i for i in self.outbox() if i["4"] == "001"]
-        self.assertTrue(uses)
-        self.assertTrue(all(self.day_text(midnight(1)) in i["7"] or
-                            self.day_text(midnight(3)) in i["7"] for i in uses))
-
-    def test_dump_request_re_aggregates_the_last_day(self):
-        self.prepared_device()
-        self.seed_use_app(midnight(1), 5)
-        proc = self.dev.start_daemon()
-        self.assertEqual(self.pref("key_sent_date"), midnight(1))
-        # The daemon creates the key when it starts watching it; a request is taken once the
-        # sent date moves back (or the run it starts has already moved it forward again).
-        dump = "db/corvane-log-manager/dumpcontext"
-        wait_for(lambda: self.dev.vconf_get(dump) is not None, message="the dump watch")
-
-        def requested():
-            self.dev.vconf_set(dump, "int", "2")
-            try:
-                return wait_for(lambda: self.pref("key_sent_date") != midnight(1) or
-                                self.summaries(), timeout=3)
-            except AssertionError:
-                return False
-        wait_for(requested, timeout=60, interval=0, message="the dump request")
-        wait_for(lambda: len(self.summaries()) == 1, timeout=30, message="one summary")
-        self.assertEqual(self.summaries(), [self.day_text(midnight(1))])
-        self.assertEqual(self.pref("key_sent_date"), midnight(1))
-        self.assertIsNone(proc.poll())
 
     LONG_DAY = 12000  # rows of each day, each its own record
 
@@ -123,7 +89,7 @@ class ReportCycleTest(DeviceTestCase):
         records become visible at its commit, so the first day's first table shows the run
         started while two days are still to go."""
         self.prepared_device()
-        self.dev.set_pref("key_sent_date", midnight(4))
+        self.set_pref("key_sent_date", midnight(4))
         for days_ago in (3, 2, 1):
             self.seed_use_app(midnight(days_ago), self.LONG_DAY, apps=self.LONG_DAY)
         proc = self.dev.start_daemon()
@@ -158,7 +124,7 @@ class ReportCycleTest(DeviceTestCase):
         # Statements of the worker and of bus requests share one connection; a request's checks
         # once judged the worker's statements too, failing its purge mid-day.
         self.prepared_device()
-        self.dev.set_pref("key_sent_date", midnight(4))
+        self.set_pref("key_sent_date", midnight(4))
         for days_ago in (3, 2, 1):
             self.seed_use_app(midnight(days_ago), 8600, apps=20)  # all eight slices
         self.dev.start_daemon()
@@ -177,9 +143,7 @@ class ReportCycleTest(DeviceTestCase):
         for thread in threads:
             thread.start()
         try:
-            wait_for(lambda: len(self.summaries()) == 3 and self.dev.query(
-                UPLOAD_DB, "SELECT count(*) FROM survey_log") == [(0,)], timeout=30,
-                     message="three days handed over")
+            self.handed_over([self.day_text(midnight(d)) for d in (3, 2, 1)])
         finally:
             stop.set()
             for thread in threads:
@@ -188,6 +152,47 @@ class ReportCycleTest(DeviceTestCase):
         self.assertEqual(len(uses), 3 * 8 * 20)
         self.assertEqual(len(set(uses)), len(uses))
         self.assertEqual(self.dev.query(SURVEY_DB, "SELECT count(*) FROM use_app_survey"), [(0,)])
+
+    def test_sums_past_the_integer_limit_cost_no_other_record_of_the_day(self):
+        self.prepared_device()
+        proc = self.dev.start_daemon()
+        wait_for(lambda: self.dev.query(SURVEY_DB, "SELECT count(*) FROM sqlite_master WHERE "
+                                        "name='use_app_feature_survey'") == [(1,)],
+                 message="the feature table")
+        near_limit = str(2 ** 63 - 1000)
+        rows = [("evil", "BIG", near_limit), ("evil", "BIG", near_limit), ("good", "SCRN", "100"),
+                ("good", "SCRN", "250"), ("good", "WIFI", "7")]
+        for app, feature, value in rows:
+            self.dev.run_tool("logmgrctl", "insert", "use_app_feature_survey", f"app_id={app}",
+                              f"feature={feature}", "extra=-", f"value={value}")
+        proc.send_signal(signal.SIGTERM)
+        self.assertEqual(self.dev.wait_exit(proc), 0)
+        # The callers' rows belong to yesterday's 06:00-09:00 slice, beside a day of app use.
+        con = self.connect(SURVEY_DB)
+        con.execute("UPDATE use_app_feature_survey SET timestamp=? WHERE app_id IN "
+                    "('evil','good')", ((midnight(1) + 7 * 3600) * 1000,))
+        con.close()
+        self.seed_use_app(midnight(1), 6)
+        self.set_pref("key_sent_date", midnight(2))
+        self.dev.start_daemon()
+        self.handed_over([self.day_text(midnight(1))])
+
+        def records(activity):
+            return sorted((p["app_id"], p.get("feature", ""), p["count"], p.get("value", p.get(
+                "duration"))) for p in (dict(x.split("=", 1) for x in i["7"].split("¶"))
+                                        for i in self.outbox() if i["4"] == activity))
+        # The callers' own record is there too, though its fields shift: a 19-digit value
+        # renders without its comma (numbers are read back in 20 bytes).
+        self.assertEqual(records("002")[1:], [("good", "SCRN", "2", "350"),
+                                              ("good", "WIFI", "1", "7")])
+        self.assertEqual(records("002")[0][:2], ("evil", "BIG"))
+        self.assertEqual(records("001"), [(f"com.example.app{i}", "", "2", str(2003 + 2 * i))
+                                          for i in range(3)])
+        # Every row of the day went out in a record before it was purged.
+        for table in ("use_app_survey", "use_app_feature_survey"):
+            self.assertEqual(self.dev.query(SURVEY_DB, f"SELECT count(*) FROM {table} WHERE "
+                                            "timestamp < ?", (midnight(0) * 1000,)), [(0,)])
+        self.assertEqual(self.pref("key_sent_date"), midnight(1))
 
     def test_consent_withdrawn_during_a_run_lets_it_finish_then_exits(self):
         proc = self.long_run()
