@@ -27,8 +27,8 @@ namespace _CorvaneLogManager {
 class AppDbTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    unsetenv("DISPLAY");  // the tests drive the monitors directly, without X
-    setenv("ECORE_NO_SYSTEM_MODULES", "1", 1);
+    unsetenv("DISPLAY");                        // the tests drive the monitors directly, without X
+    setenv("ECORE_NO_SYSTEM_MODULES", "1", 1);  // they would look for a system bus
     ASSERT_EQ(
         Sh("mkdir -p '" + sysroot + "/opt/usr/dbspace' '" + sysroot + "/opt/dbspace' '" + sysroot +
            "/opt/etc' && ln -s /usr/share/zoneinfo/UTC '" + sysroot + "/opt/etc/localtime'"),

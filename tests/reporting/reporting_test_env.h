@@ -75,8 +75,10 @@ class ReportingTest : public ProviderTest {
     return static_cast<int64_t>(mktime(&tm)) * 1000 + ms;
   }
   void Exec(DbConnection* conn, const std::string& sql) {
-    ASSERT_EQ(sqlite3_exec(conn->Handle(), sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK)
-        << sql;
+    char* error = nullptr;
+    ASSERT_EQ(sqlite3_exec(conn->Handle(), sql.c_str(), nullptr, nullptr, &error), SQLITE_OK)
+        << sql << ": " << (error ? error : "");
+    sqlite3_free(error);
   }
   // Column 0 of every row, as text.
   std::vector<std::string> Column(DbConnection* conn, const std::string& sql) {

@@ -272,8 +272,7 @@ class RestartTest(DeviceStatusCase):
         self.dev.devsim("earjack", "in")
         self.start(clock)
         self.assertEqual(self.dev.query(FEATURE_DB, screen), [(10000,), (200000,)])
-        self.assertEqual(self.dev.query(".pref.db", "SELECT pref_data FROM pref WHERE "
-                                        "pref_key = 'key_last_shutdown_time'"), [("0",)])
+        self.assertEqual(self.dev.pref("key_last_shutdown_time"), "0")
         # The initial snapshot samples the charger (after its wait) and the headset.
         self.assertEqual(self.dev.query(FEATURE_DB, "SELECT extra, value FROM "
                                         "use_app_feature_survey WHERE feature = 'BAT1'"),

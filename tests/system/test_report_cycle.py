@@ -36,13 +36,8 @@ class ReportCycleTest(DeviceTestCase):
         return con
 
     def pref(self, key):
-        rows = self.dev.query(PREF_DB, "SELECT pref_data FROM pref WHERE pref_key=?", (key,))
-        return int(rows[0][0]) if rows else None
-
-    def set_pref(self, key, value):
-        con = self.connect(PREF_DB)
-        con.execute("INSERT OR REPLACE INTO pref VALUES(?,?)", (key, str(value)))
-        con.close()
+        value = self.dev.pref(key)
+        return int(value) if value is not None else None
 
     def outbox(self):
         path = self.dev.path(OUTBOX)
@@ -89,7 +84,7 @@ class ReportCycleTest(DeviceTestCase):
         records become visible at its commit, so the first day's first table shows the run
         started while two days are still to go."""
         self.prepared_device()
-        self.set_pref("key_sent_date", midnight(4))
+        self.dev.set_pref("key_sent_date", midnight(4))
         for days_ago in (3, 2, 1):
             self.seed_use_app(midnight(days_ago), self.LONG_DAY, apps=self.LONG_DAY)
         proc = self.dev.start_daemon()
@@ -124,7 +119,7 @@ class ReportCycleTest(DeviceTestCase):
         # Statements of the worker and of bus requests share one connection; a request's checks
         # once judged the worker's statements too, failing its purge mid-day.
         self.prepared_device()
-        self.set_pref("key_sent_date", midnight(4))
+        self.dev.set_pref("key_sent_date", midnight(4))
         for days_ago in (3, 2, 1):
             self.seed_use_app(midnight(days_ago), 8600, apps=20)  # all eight slices
         self.dev.start_daemon()
@@ -173,7 +168,7 @@ class ReportCycleTest(DeviceTestCase):
                     "('evil','good')", ((midnight(1) + 7 * 3600) * 1000,))
         con.close()
         self.seed_use_app(midnight(1), 6)
-        self.set_pref("key_sent_date", midnight(2))
+        self.dev.set_pref("key_sent_date", midnight(2))
         self.dev.start_daemon()
         self.handed_over([self.day_text(midnight(1))])
 

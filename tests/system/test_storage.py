@@ -11,22 +11,18 @@ ID_PATTERN = r"^T[a-zA-Z0-9]{12}[0-9]{13}[A-Z][a-z][0-9][0-9][A-Z][a-z],?$"
 
 class StorageTest(DeviceTestCase):
 
-    def pref(self, key):
-        rows = self.dev.query(".pref.db", "SELECT pref_data FROM pref WHERE pref_key = ?", (key,))
-        return rows[0][0] if rows else None
-
     def test_shutdown_time_written_at_stop_and_device_id_kept(self):
         self.dev.set_consent(True)
         self.dev.start_daemon()
-        device_id = wait_for(lambda: self.pref("key_deviceid"), message="the device id")
+        device_id = wait_for(lambda: self.dev.pref("key_deviceid"), message="the device id")
         self.assertRegex(device_id, ID_PATTERN)
-        self.assertIsNone(self.pref("key_last_shutdown_time"))
+        self.assertIsNone(self.dev.pref("key_last_shutdown_time"))
         for _ in range(2):
             before = int(time.time())
             self.dev.signal(signal.SIGTERM)
             self.assertEqual(self.dev.wait_exit(), 0)
-            self.assertTrue(before <= int(self.pref("key_last_shutdown_time")) <= time.time() + 1)
-            self.assertEqual(self.pref("key_deviceid"), device_id)
+            self.assertTrue(before <= int(self.dev.pref("key_last_shutdown_time")) <= time.time() + 1)
+            self.assertEqual(self.dev.pref("key_deviceid"), device_id)
             self.dev.daemon = self.dev.start_daemon()
             self.assertIsNone(self.dev.daemon.poll())
 
